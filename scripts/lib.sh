@@ -60,8 +60,12 @@ telvane_build() {
 # so they never point at a shell pipe.
 telvane_wine_start() {
   mkdir -p "$WINEPREFIX"
-  (wineserver -p </dev/null >/dev/null 2>&1)
-  wine wineboot --init </dev/null >/dev/null 2>&1
+  (wineserver -p </dev/null >/dev/null 2>&1) || true  # already running is fine
+  wine wineboot --init </dev/null >/dev/null 2>&1 || true
+  if [ ! -f "$WINEPREFIX/system.reg" ]; then
+    telvane_log "could not create the Wine prefix $WINEPREFIX"
+    return 1
+  fi
 }
 
 telvane_wine_stop() {
