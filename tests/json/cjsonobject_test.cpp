@@ -1,0 +1,387 @@
+// The reference-counted holders: builders, the COM interface as a client sees it, the
+// tagged counts, and moving nodes between holders as the trace document does.
+#include "lib/cjsonobject.h"
+#include "servicelib/eventtrace.h"
+#include "tests/common/testsupport.h"
+
+#include <gtest/gtest.h>
+
+#include <mutex>
+#include <string>
+#include <vector>
+
+using testsupport::FailureCapture;
+
+namespace
+{
+std::string Text(const CJsonObject *pObject)
+{
+    std::string str;
+    return pObject->ToString(str);
+}
+
+// GetJson's text, checked against its length; "<hr>" on failure.
+std::string Json(IJsonObject *pObject)
+{
+    LPSTR szText = nullptr;
+    DWORD cbText = 0;
+    HRESULT hr = pObject->GetJson(&szText, &cbText);
+    if (FAILED(hr))
+    {
+        EXPECT_EQ(nullptr, szText);
+        EXPECT_EQ(0u, cbText);
+        return "<" + std::to_string(static_cast<unsigned long>(hr)) + ">";
+    }
+    std::string str(szText);
+    EXPECT_EQ(str.size() + 1, cbText);
+    CoTaskMemFree(szText);
+    return str;
+}
+
+std::mutex s_lock;
+std::vector<std::string> s_rgTraceLines;
+
+void CaptureWrite(REGHANDLE, const EVENT_DESCRIPTOR *pDescriptor, ULONG cData,
+                  const EVENT_DATA_DESCRIPTOR *pData)
+{
+    std::lock_guard<std::mutex> guard(s_lock);
+    std::string strLine = std::to_string(pDescriptor->Id);
+    for (ULONG i = 0; i < cData; i++)
+    {
+        strLine += '|';
+        strLine.append(reinterpret_cast<const char *>(pData[i].Ptr), pData[i].Size);
+    }
+    s_rgTraceLines.push_back(strLine);
+}
+
+// A trace session on the main provider whose events land in s_rgTraceLines.
+class TraceSession
+{
+public:
+    TraceSession()
+    {
+        s_rgTraceLines.clear();
+        TraceSetWriteHook(CaptureWrite);
+        TraceProviderEnableCallback(&TELVANE_PROVIDER_GUID, EVENT_CONTROL_CODE_ENABLE_PROVIDER, 0,
+                                    0x100, 0, nullptr, &g_TelvaneTraceProvider);
+    }
+    ~TraceSession()
+    {
+        TraceProviderEnableCallback(&TELVANE_PROVIDER_GUID, EVENT_CONTROL_CODE_DISABLE_PROVIDER, 0,
+                                    0, 0, nullptr, &g_TelvaneTraceProvider);
+        TraceSetWriteHook(nullptr);
+    }
+    std::vector<std::string> TakeLines()
+    {
+        std::lock_guard<std::mutex> guard(s_lock);
+        std::vector<std::string> rg;
+        rg.swap(s_rgTraceLines);
+        return rg;
+    }
+};
+
+const std::string c_strNotTerminatedLine =
+    std::string("1001|**Event sent that is not null terminated,  this is safe but a perf hit") +
+    '\0';
+
+// {01234567-89AB-CDEF-0123-456789ABCDEF}
+const GUID c_guidSample = {
+    0x01234567, 0x89AB, 0xCDEF, {0x01, 0x23, 0x45, 0x67, 0x89, 0xAB, 0xCD, 0xEF}};
+} // namespace
+
+TEST(CJsonObject, BuildersAndGetJson)
+{
+    CJsonObject *pObject = new CJsonObject();
+    EXPECT_EQ("{}", Json(pObject));
+    LPSTR szText = nullptr;
+    DWORD cbText = 0;
+    ASSERT_EQ(S_OK, pObject->GetJson(&szText, &cbText));
+    EXPECT_EQ(3u, cbText);
+    EXPECT_EQ('\0', szText[2]);
+    CoTaskMemFree(szText);
+    EXPECT_EQ(E_POINTER, pObject->GetJson(nullptr, &cbText));
+    EXPECT_EQ(E_POINTER, pObject->GetJson(&szText, nullptr));
+
+    EXPECT_EQ(S_OK, pObject->AddDword("d", 4000000000u));
+    EXPECT_EQ(S_OK, pObject->AddUlonglong("t", 133000000000000000ull));
+    EXPECT_EQ(S_OK, pObject->AddDouble("x", 6.0));
+    EXPECT_EQ(S_OK, pObject->AddBool("b", true));
+    EXPECT_EQ(S_OK, pObject->AddString("w", L"wide/\x00e9"));
+    EXPECT_EQ(S_OK, pObject->AddString("n", "narrow\n"));
+    EXPECT_EQ(S_OK, pObject->AddGuid("g", c_guidSample));
+    EXPECT_EQ(S_OK, pObject->AddRawJson("r", "[1, 2]", 0));
+    EXPECT_EQ(S_OK, pObject->AddDword(L"D", 1));
+    EXPECT_EQ(S_OK, pObject->AddUlong(L"U", 2));
+    EXPECT_EQ(S_OK, pObject->AddString(L"W", L"v"));
+    EXPECT_EQ(S_OK, pObject->AddString(L"N", "v"));
+    EXPECT_EQ(E_POINTER, pObject->AddString("none", static_cast<LPCWSTR>(nullptr)));
+    EXPECT_EQ(E_POINTER, pObject->AddString(L"none", static_cast<LPCSTR>(nullptr)));
+    EXPECT_EQ(E_POINTER, pObject->AddRawJson("none", nullptr, 0));
+    EXPECT_EQ(E_POINTER, pObject->AddObject("none", nullptr));
+    EXPECT_EQ(E_POINTER, pObject->AddArray("none", nullptr));
+    const std::string strExpected =
+        "{\"d\":4000000000,\"t\":133000000000000000,\"x\":6,\"b\":true,"
+        "\"w\":\"wide\\/\\u00e9\",\"n\":\"narrow\\n\",\"g\":\"01234567-89ab-cdef-0123-"
+        "456789abcdef\",\"r\":[1, 2],\"D\":1,\"U\":2,\"W\":\"v\",\"N\":\"v\"}";
+    EXPECT_EQ(strExpected, Json(pObject));
+    EXPECT_EQ(strExpected, Text(pObject));
+    EXPECT_EQ(0u, pObject->Release());
+}
+
+TEST(CJsonObject, WideTextConvertsOrBecomesError)
+{
+    EXPECT_EQ("\xe9t\xe9", WideToNarrow(L"\x00e9t\x00e9")); // the ANSI code page, not UTF-8
+    EXPECT_EQ("error", WideToNarrow(nullptr));
+    EXPECT_EQ("", WideToNarrow(L""));
+    // 255 bytes and the terminator fit the 256-byte buffer; one more does not.
+    EXPECT_EQ(std::string(255, 'n'), WideToNarrow(std::wstring(255, L'n').c_str()));
+    EXPECT_EQ("error", WideToNarrow(std::wstring(256, L'n').c_str()));
+
+    CJsonObject *pObject = new CJsonObject();
+    EXPECT_EQ(S_OK, pObject->AddDword(std::wstring(300, L'n').c_str(), 1));
+    EXPECT_EQ(S_OK, pObject->AddString(L"long", std::wstring(300, L'v').c_str()));
+    EXPECT_EQ(S_OK, pObject->AddString("long2", std::wstring(256, L'v').c_str()));
+    EXPECT_EQ("{\"error\":1,\"long\":\"error\",\"long2\":\"error\"}", Json(pObject));
+    pObject->Release();
+
+    GUID guidZero = {};
+    EXPECT_EQ("00000000-0000-0000-0000-000000000000", GuidToString(guidZero));
+    EXPECT_EQ("01234567-89ab-cdef-0123-456789abcdef", GuidToString(c_guidSample));
+}
+
+TEST(CJsonObject, RawJsonTakesTextToItsTerminator)
+{
+    TraceSession session;
+    CJsonObject *pObject = new CJsonObject();
+
+    // With the terminator counted: stored as it is, no trace line.
+    const char szWithZero[] = "{\"a\":1}";
+    ASSERT_EQ(8u, sizeof(szWithZero));
+    EXPECT_EQ(S_OK, pObject->AddRawJson(L"t", szWithZero, 8));
+    EXPECT_TRUE(session.TakeLines().empty());
+
+    // Without: the trace line, and only the seven bytes (what follows is not the caller's).
+    const char rgchNoZero[] = {'{', '"', 'a', '"', ':', '1', '}', 'X', 'Y', '\0'};
+    EXPECT_EQ(S_OK, pObject->AddRawJson(L"u", rgchNoZero, 7));
+    EXPECT_EQ(std::vector<std::string>{c_strNotTerminatedLine}, session.TakeLines());
+    EXPECT_EQ(S_OK, pObject->AddRawJson("v", rgchNoZero, 7)); // the narrow builder too
+    EXPECT_EQ(std::vector<std::string>{c_strNotTerminatedLine}, session.TakeLines());
+
+    // A zero byte inside the length cuts the text there.
+    EXPECT_EQ(S_OK, pObject->AddRawJson(L"w",
+                                        "12\0"
+                                        "34",
+                                        6));
+    EXPECT_EQ(S_OK, pObject->AddRawJson(L"x",
+                                        "56\0"
+                                        "7",
+                                        4)); // last byte not zero: traced
+    EXPECT_EQ(std::vector<std::string>{c_strNotTerminatedLine}, session.TakeLines());
+
+    EXPECT_EQ("{\"t\":{\"a\":1},\"u\":{\"a\":1},\"v\":{\"a\":1},\"w\":12,\"x\":56}", Json(pObject));
+    pObject->Release();
+}
+
+TEST(CJsonObject, AddObjectTakesTheChildTextAtThatMoment)
+{
+    TraceSession session;
+    CJsonObject *pParent = new CJsonObject();
+    CJsonObject *pChild = new CJsonObject();
+    pChild->AddDword("a", 1);
+    EXPECT_EQ(S_OK, pParent->AddObject(L"c", pChild));
+    EXPECT_EQ(S_OK, pParent->AddObject("d", pChild));
+    pChild->AddDword("b", 2);
+    EXPECT_EQ(S_OK, pParent->AddObject(L"e", pChild));
+    EXPECT_EQ(S_OK, pParent->AddObject(L"self", pParent)); // its own text so far
+    EXPECT_EQ("{\"c\":{\"a\":1},\"d\":{\"a\":1},\"e\":{\"a\":1,\"b\":2},"
+              "\"self\":{\"c\":{\"a\":1},\"d\":{\"a\":1},\"e\":{\"a\":1,\"b\":2}}}",
+              Json(pParent));
+    // The child's text carries its terminator: no trace line.
+    EXPECT_TRUE(session.TakeLines().empty());
+    EXPECT_EQ(1, pChild->RefCount());
+
+    // A child that cannot give its text: the code comes back and nothing is added.
+    CJsonArray *pArray = new CJsonArray();
+    pChild->AddRef(1);
+    EXPECT_EQ(S_OK, pArray->AddObject(pChild));
+    EXPECT_EQ("<" + std::to_string(static_cast<unsigned long>(E_UNEXPECTED)) + ">", Json(pChild));
+    EXPECT_EQ(E_UNEXPECTED, pParent->AddObject(L"gone", pChild));
+    EXPECT_EQ(E_UNEXPECTED, pParent->AddObject("gone", pChild));
+    EXPECT_EQ(std::string::npos, Json(pParent).find("gone"));
+    EXPECT_EQ(0u, pChild->Release(1));
+    EXPECT_EQ(0u, pArray->Release(0));
+    EXPECT_EQ(0u, pParent->Release());
+}
+
+TEST(CJsonObject, QueryInterfaceAndSlotOrder)
+{
+    CJsonObject *pObject = new CJsonObject();
+    IJsonObject *pInterface = pObject;
+
+    void *pv = nullptr;
+    EXPECT_EQ(S_OK, pInterface->QueryInterface(IID_IUnknown, &pv));
+    EXPECT_EQ(static_cast<IUnknown *>(pInterface), pv);
+    EXPECT_EQ(S_OK, pInterface->QueryInterface(IID_IJsonObject, &pv));
+    EXPECT_EQ(pInterface, pv);
+    EXPECT_EQ(3, pObject->TagCount(0));
+    EXPECT_EQ(3, pObject->RefCount());
+
+    pv = &pv;
+    EXPECT_EQ(E_NOINTERFACE, pInterface->QueryInterface(IID_IDispatch, &pv));
+    EXPECT_EQ(nullptr, pv);
+    const IID iidAlmost = {
+        0x35365921, 0x6920, 0x4683, {0x98, 0x4A, 0xAC, 0x37, 0x96, 0x29, 0x68, 0x19}};
+    pv = &pv;
+    EXPECT_EQ(E_NOINTERFACE, pInterface->QueryInterface(iidAlmost, &pv));
+    EXPECT_EQ(nullptr, pv);
+    {
+        FailureCapture failures;
+        EXPECT_EQ(E_POINTER, pInterface->QueryInterface(IID_IJsonObject, nullptr));
+        ASSERT_EQ(1u, failures.Count());
+        EXPECT_TRUE(failures.Contains(L"lib/cjsonobject.cpp("));
+        EXPECT_TRUE(failures.Contains(L"Assertion failure: FALSE"));
+    }
+    EXPECT_EQ(3, pObject->RefCount());
+
+    // The interface as a C client sees it: slots by position, not by name.
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_QI)(IJsonObject *, REFIID, void **);
+    typedef ULONG(STDMETHODCALLTYPE * PFN_REF)(IJsonObject *);
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_DWORD)(IJsonObject *, LPCWSTR, DWORD);
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_WSTR)(IJsonObject *, LPCWSTR, LPCWSTR);
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_STR)(IJsonObject *, LPCWSTR, LPCSTR);
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_OBJ)(IJsonObject *, LPCWSTR, IJsonObject *);
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_RAW)(IJsonObject *, LPCWSTR, LPCSTR, DWORD);
+    typedef HRESULT(STDMETHODCALLTYPE * PFN_GET)(IJsonObject *, LPSTR *, DWORD *);
+    void **rgpfn = *reinterpret_cast<void ***>(pInterface);
+
+    CJsonObject *pChild = new CJsonObject();
+    pChild->AddBool("k", false);
+    EXPECT_EQ(E_NOINTERFACE,
+              reinterpret_cast<PFN_QI>(rgpfn[0])(pInterface, IID_IClassFactory, &pv));
+    EXPECT_EQ(4u, reinterpret_cast<PFN_REF>(rgpfn[1])(pInterface));
+    EXPECT_EQ(3u, reinterpret_cast<PFN_REF>(rgpfn[2])(pInterface));
+    EXPECT_EQ(S_OK, reinterpret_cast<PFN_DWORD>(rgpfn[3])(pInterface, L"dword", 3));
+    EXPECT_EQ(S_OK, reinterpret_cast<PFN_DWORD>(rgpfn[4])(pInterface, L"ulong", 4));
+    EXPECT_EQ(S_OK, reinterpret_cast<PFN_WSTR>(rgpfn[5])(pInterface, L"wide", L"w"));
+    EXPECT_EQ(S_OK, reinterpret_cast<PFN_STR>(rgpfn[6])(pInterface, L"narrow", "n"));
+    EXPECT_EQ(S_OK, reinterpret_cast<PFN_OBJ>(rgpfn[7])(pInterface, L"object", pChild));
+    EXPECT_EQ(S_OK, reinterpret_cast<PFN_RAW>(rgpfn[8])(pInterface, L"raw", "[7]", 4));
+    LPSTR szText = nullptr;
+    DWORD cbText = 0;
+    ASSERT_EQ(S_OK, reinterpret_cast<PFN_GET>(rgpfn[9])(pInterface, &szText, &cbText));
+    EXPECT_EQ(std::string("{\"dword\":3,\"ulong\":4,\"wide\":\"w\",\"narrow\":\"n\","
+                          "\"object\":{\"k\":false},\"raw\":[7]}"),
+              szText);
+    CoTaskMemFree(szText);
+
+    pChild->Release();
+    EXPECT_EQ(2u, pInterface->Release());
+    EXPECT_EQ(1u, pInterface->Release());
+    EXPECT_EQ(0u, pInterface->Release());
+}
+
+TEST(CJsonObject, TaggedReferences)
+{
+    CJsonObject *pObject = new CJsonObject();
+    {
+        CTaggedPtr<CJsonObject, 1> holder;
+        holder = pObject;
+        EXPECT_EQ(1, pObject->TagCount(1));
+        EXPECT_EQ(2, pObject->RefCount());
+        EXPECT_EQ(1u, pObject->Release(0)); // the creator lets go; the holder keeps it
+        EXPECT_EQ(S_OK, holder->AddDword("alive", 1));
+        EXPECT_EQ(2u, pObject->AddRef(5));
+        EXPECT_EQ(1u, pObject->Release(5));
+    }
+
+    // A release under a tag that holds nothing is the one fatal error here; as under a
+    // debugger, the total still falls.
+    FailureCapture failures;
+    CJsonObject *pWrong = new CJsonObject();
+    pWrong->AddRef(1);
+    EXPECT_EQ(1u, pWrong->Release(2));
+    ASSERT_EQ(1u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"CJsonObject::Release: Fatal error"));
+    EXPECT_TRUE(failures.Contains(L"from Release"));
+    EXPECT_EQ(-1, pWrong->TagCount(2));
+    EXPECT_EQ(1, pWrong->TagCount(1));
+
+    // A tag past the six is reported without touching any count.
+    EXPECT_EQ(1u, pWrong->AddRef(6));
+    EXPECT_EQ(1u, pWrong->Release(6));
+    EXPECT_EQ(3u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"CJsonObject::AddRef: Fatal error"));
+    EXPECT_EQ(1, pWrong->RefCount());
+    EXPECT_EQ(0u, pWrong->Release(1));
+
+    CJsonArray *pArray = new CJsonArray();
+    pArray->AddRef(3);
+    EXPECT_EQ(1u, pArray->Release(4));
+    EXPECT_EQ(4u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"CJsonArray::Release: Fatal error"));
+    EXPECT_EQ(1u, pArray->AddRef(7));
+    EXPECT_EQ(1u, pArray->Release(7));
+    EXPECT_EQ(6u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"CJsonArray::AddRef: Fatal error"));
+    EXPECT_EQ(0u, pArray->Release(3));
+    {
+        CTaggedPtr<CJsonArray, 1> holder;
+        holder = new CJsonArray();
+        EXPECT_EQ(1u, holder->Release(0)); // the holder's destructor lets go last
+    }
+    EXPECT_EQ(6u, failures.Count());
+}
+
+TEST(CJsonArray, NodesMoveIntoTheTraceDocument)
+{
+    CTaggedPtr<CJsonObject, 1> trace;
+    trace = new CJsonObject();
+    trace->Release(0);
+    trace->AddGuid("ActivityID", c_guidSample);
+
+    CTaggedPtr<CJsonArray, 1> group;
+    group = new CJsonArray();
+    group->Release(0);
+    for (ULONG i = 0; i < 3; i++)
+    {
+        CJsonObject *pRecord = new CJsonObject();
+        pRecord->AddRef(2); // watch it after the move
+        pRecord->AddUlonglong("TimeStamp", 100 + i);
+        pRecord->AddRawJson("Value", "{\"e\":1}", 8);
+        EXPECT_EQ(S_OK, group->AddObject(pRecord));
+        // The caller's tag-0 reference is gone, and so is the node.
+        EXPECT_EQ(0, pRecord->TagCount(0));
+        EXPECT_EQ(1, pRecord->RefCount());
+        EXPECT_EQ(E_UNEXPECTED, pRecord->AddDword("late", 1));
+        EXPECT_EQ(E_UNEXPECTED, pRecord->AddDword(L"late", 1));
+        EXPECT_EQ(E_UNEXPECTED, pRecord->AddArray("late", group));
+        EXPECT_EQ("", Text(pRecord));
+        EXPECT_EQ(0u, pRecord->Release(2));
+    }
+    // A record whose node is gone: nothing is added, the caller's reference still goes.
+    CJsonObject *pMoved = new CJsonObject();
+    pMoved->AddRef(2);
+    group->AddObject(pMoved);
+    pMoved->AddRef(0);
+    EXPECT_EQ(E_UNEXPECTED, group->AddObject(pMoved));
+    EXPECT_EQ(1, pMoved->RefCount());
+    EXPECT_EQ(0u, pMoved->Release(2));
+
+    EXPECT_EQ(S_OK, trace->AddArray("ID" + GuidToString(c_guidSample), group));
+    trace->AddBool("LogEnd", true);
+
+    // The array's node now belongs to the trace: both ways of adding again fail.
+    EXPECT_EQ(E_UNEXPECTED, trace->AddArray("again", group));
+    CJsonObject *pLate = new CJsonObject();
+    pLate->AddRef(1);
+    EXPECT_EQ(E_UNEXPECTED, group->AddObject(pLate));
+    EXPECT_EQ(0, pLate->TagCount(0));
+    EXPECT_EQ(0u, pLate->Release(1));
+    group.Release();
+
+    EXPECT_EQ("{\"ActivityID\":\"01234567-89ab-cdef-0123-456789abcdef\","
+              "\"ID01234567-89ab-cdef-0123-456789abcdef\":[{\"TimeStamp\":100,\"Value\":{\"e\":1}},"
+              "{\"TimeStamp\":101,\"Value\":{\"e\":1}},{\"TimeStamp\":102,\"Value\":{\"e\":1}},{}],"
+              "\"LogEnd\":true}",
+              Text(trace));
+}
