@@ -1,0 +1,479 @@
+// AsyncPipe through real pipe instances and real clients under Wine.
+#include "servicelib/asyncpipe.h"
+#include "client/cpipeclient.h"
+#include "platform/securityruntime/securityruntime.h"
+#include "tests/common/testsupport.h"
+#include "tests/pipe/pipetestsupport.h"
+
+#include <gtest/gtest.h>
+#include <aclapi.h>
+#include <sddl.h>
+#include <atomic>
+#include <thread>
+
+using namespace pipetest;
+
+namespace
+{
+// Every test runs with failure reports captured: a fatal error or assertion fails the test
+// instead of ending the run.
+class AsyncPipeTest : public CPipeTest
+{
+protected:
+    // A pipe listening on a fresh name with one sink for both roles.
+    struct Listener
+    {
+        AsyncPipe *pPipe = nullptr;
+        CRecordingSink *pSink = nullptr;
+    };
+
+    static Listener Listen(const std::wstring &name, bool fEcho = false, AsyncPipe *pPipe = nullptr)
+    {
+        Listener listener;
+        listener.pPipe = pPipe != nullptr ? pPipe : new AsyncPipe();
+        listener.pSink = new CRecordingSink();
+        if (fEcho)
+        {
+            listener.pSink->EchoThrough(listener.pPipe);
+        }
+        listener.pPipe->Listen(name.c_str(), listener.pSink, listener.pSink);
+        return listener;
+    }
+
+    // A client on the name, once the listener has seen it arrive.
+    static bool ConnectTo(const std::wstring &name, const Listener &listener, CPipeClient *pClient)
+    {
+        return pClient->Connect(name.c_str(), c_dwWaitMs) == S_OK &&
+               listener.pSink->WaitForConnected(1);
+    }
+
+    // The owner's side of the end: close, then every reference the pipe took on the sink and
+    // every operation's reference on the pipe must be gone.
+    static void CloseAndRelease(const Listener &listener, ULONG cSinkRefsLeft = 1)
+    {
+        listener.pPipe->Close();
+        EXPECT_TRUE(listener.pSink->WaitForRefs(cSinkRefsLeft)) << "the pipe still holds its sinks";
+        EXPECT_TRUE(WaitForPipeRefs(listener.pPipe, 1)) << "an operation is still pending";
+        listener.pPipe->Release();
+        listener.pSink->Release();
+    }
+};
+
+// Holds the pipe's Synchronizer busy in one marked write event, so that a Listen posted
+// meanwhile waits in the queue after the pipe instance already exists.
+class CHeldPipe : public AsyncPipe
+{
+public:
+    CHeldPipe()
+        : m_hEntered(CreateEventW(nullptr, TRUE, FALSE, nullptr))
+        , m_hProceed(CreateEventW(nullptr, TRUE, FALSE, nullptr))
+    {
+    }
+    ~CHeldPipe() override
+    {
+        CloseHandle(m_hEntered);
+        CloseHandle(m_hProceed);
+    }
+
+    void HoldInNextEvent() { m_fHold = true; }
+
+    void Dispatch(ULONG ulEventType, ULONG_PTR ulArg1, ULONG_PTR ulArg2, ULONG_PTR ulArg3) override
+    {
+        if (m_fHold.exchange(false))
+        {
+            SetEvent(m_hEntered);
+            WaitForSingleObject(m_hProceed, c_dwWaitMs);
+        }
+        AsyncPipe::Dispatch(ulEventType, ulArg1, ulArg2, ulArg3);
+    }
+
+    HANDLE m_hEntered;
+    HANDLE m_hProceed;
+    std::atomic<bool> m_fHold{false};
+};
+} // namespace
+
+// The ordinary life of a connection: connected notice, a full-size message delivered whole
+// and echoed, then the client leaves while a read is pending.
+TEST_F(AsyncPipeTest, DeliversWholeMessagesAndOneBreakWhenClientLeaves)
+{
+    std::wstring name = UniquePipeName(L"life");
+    Listener listener = Listen(name, true);
+    EXPECT_EQ(3u, listener.pSink->Refs()) << "Listen hands the pipe a reference per sink";
+
+    CPipeClient client;
+    ASSERT_TRUE(ConnectTo(name, listener, &client));
+    EXPECT_TRUE(listener.pSink->WaitForRefs(2)) << "the connect sink is released once connected";
+
+    std::vector<BYTE> full = Pattern(AsyncPipe::c_cbMaxMessage, 1);
+    std::vector<BYTE> small = Pattern(5, 2);
+    ASSERT_EQ(S_OK, client.WriteMessage(full.data(), static_cast<DWORD>(full.size()), c_dwWaitMs));
+    ASSERT_EQ(S_OK,
+              client.WriteMessage(small.data(), static_cast<DWORD>(small.size()), c_dwWaitMs));
+    std::vector<BYTE> echo(4096);
+    DWORD cbEcho = 0;
+    ASSERT_EQ(S_OK, client.ReadMessage(echo.data(), static_cast<DWORD>(echo.size()), &cbEcho,
+                                       c_dwWaitMs));
+    EXPECT_EQ(full, std::vector<BYTE>(echo.begin(), echo.begin() + cbEcho));
+    ASSERT_EQ(S_OK, client.ReadMessage(echo.data(), static_cast<DWORD>(echo.size()), &cbEcho,
+                                       c_dwWaitMs));
+    EXPECT_EQ(small, std::vector<BYTE>(echo.begin(), echo.begin() + cbEcho));
+    std::vector<std::vector<BYTE>> messages = listener.pSink->Messages();
+    ASSERT_EQ(2u, messages.size());
+    EXPECT_EQ(full, messages[0]) << "a 1200-byte message arrives in one piece";
+    EXPECT_EQ(small, messages[1]);
+
+    client.Close();
+    ASSERT_TRUE(listener.pSink->WaitForBroken(1));
+    EXPECT_TRUE(listener.pSink->WaitForRefs(1)) << "the data sink is released with the break";
+    // No read is pending after the break: only the owner's reference is left.
+    EXPECT_TRUE(WaitForPipeRefs(listener.pPipe, 1));
+    EXPECT_EQ(1, listener.pSink->BrokenCount());
+    EXPECT_EQ(1, listener.pSink->ConnectedCount());
+
+    // Closing after the break changes nothing for the sink.
+    CloseAndRelease(listener);
+}
+
+// A client that opens the instance before the pipe's connect call is issued (535).
+TEST_F(AsyncPipeTest, ClientConnectedBeforeConnectCallIsConnected)
+{
+    std::wstring name = UniquePipeName(L"early");
+    CHeldPipe *pPipe = new CHeldPipe();
+    pPipe->HoldInNextEvent();
+    std::thread holder([&] {
+        BYTE b = 0;
+        pPipe->Write(&b, 1); // not listening yet: freed unwritten, after the hold
+    });
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(pPipe->m_hEntered, c_dwWaitMs));
+
+    Listener listener = Listen(name, true, pPipe); // the instance exists; the connect waits
+    CPipeClient client;
+    HRESULT hrConnect = client.Connect(name.c_str(), c_dwWaitMs);
+    EXPECT_EQ(0, listener.pSink->ConnectedCount());
+    SetEvent(pPipe->m_hProceed);
+    holder.join();
+    ASSERT_EQ(S_OK, hrConnect);
+
+    ASSERT_TRUE(listener.pSink->WaitForConnected(1));
+    BYTE rgb[3] = {7, 8, 9};
+    ASSERT_EQ(S_OK, client.WriteMessage(rgb, sizeof(rgb), c_dwWaitMs));
+    BYTE rgbEcho[16];
+    DWORD cbEcho = 0;
+    ASSERT_EQ(S_OK, client.ReadMessage(rgbEcho, sizeof(rgbEcho), &cbEcho, c_dwWaitMs));
+    EXPECT_EQ(3u, cbEcho);
+
+    listener.pSink->AddRef();
+    CloseAndRelease(listener, 2);
+    EXPECT_EQ(1, listener.pSink->BrokenCount());
+    listener.pSink->Release();
+}
+
+// A client that arrives while the close is already under way: its connect completes after
+// the handle is gone. The owner must still get its one break and both sinks back, or owner and
+// pipe keep each other alive for good.
+TEST_F(AsyncPipeTest, ConnectCompletingAfterCloseStillEndsInOneBreak)
+{
+    std::wstring name = UniquePipeName(L"closing");
+    CHeldPipe *pPipe = new CHeldPipe();
+    Listener listener = Listen(name, false, pPipe);
+    listener.pSink->AddRef();
+    pPipe->HoldInNextEvent();
+    std::thread holder([&] { pPipe->Close(); });
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(pPipe->m_hEntered, c_dwWaitMs));
+
+    CPipeClient client;
+    ASSERT_EQ(S_OK, client.Connect(name.c_str(), c_dwWaitMs));
+    // Owner, pending connect, the held close and the queued connect completion.
+    EXPECT_TRUE(WaitForPipeRefs(pPipe, 4));
+    SetEvent(pPipe->m_hProceed);
+    holder.join();
+
+    EXPECT_TRUE(listener.pSink->WaitForRefs(2)) << "the pipe still holds its sinks";
+    EXPECT_EQ(0, listener.pSink->ConnectedCount()) << "the owner closed before the connection";
+    EXPECT_EQ(1, listener.pSink->BrokenCount());
+    CloseAndRelease(listener, 2);
+    listener.pSink->Release();
+}
+
+// Buffers posted after the close never reach the client.
+TEST_F(AsyncPipeTest, WritesAfterCloseAreFreedUnwritten)
+{
+    std::wstring name = UniquePipeName(L"late");
+    Listener listener = Listen(name);
+    CPipeClient client;
+    ASSERT_TRUE(ConnectTo(name, listener, &client));
+
+    listener.pPipe->Close();
+    std::vector<BYTE> late = Pattern(100, 3);
+    for (int i = 0; i < 3; i++)
+    {
+        listener.pPipe->Write(late.data(), static_cast<DWORD>(late.size()));
+    }
+    BYTE rgb[256];
+    DWORD cbRead = 0;
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_BROKEN_PIPE),
+              client.ReadMessage(rgb, sizeof(rgb), &cbRead, c_dwWaitMs));
+    EXPECT_EQ(0u, cbRead);
+    ASSERT_TRUE(listener.pSink->WaitForBroken(1)) << "the owner's close still ends in one break";
+    listener.pSink->AddRef();     // for the count after the release
+    CloseAndRelease(listener, 2); // no write may be pending
+    EXPECT_EQ(1, listener.pSink->BrokenCount());
+    listener.pSink->Release();
+}
+
+// A write the client does not take stays pending; the buffers queued behind it are dropped by
+// the close and the pending one by its completion.
+TEST_F(AsyncPipeTest, CloseWithWritePendingAndMoreQueued)
+{
+    std::wstring name = UniquePipeName(L"pending");
+    Listener listener = Listen(name);
+    CPipeClient client;
+    ASSERT_TRUE(ConnectTo(name, listener, &client));
+
+    std::vector<BYTE> big(256 * 1024, 0xA1); // far more than the pipe's output buffer
+    listener.pPipe->Write(big.data(), static_cast<DWORD>(big.size()));
+    for (BYTE b = 0xB2; b <= 0xB4; b++)
+    {
+        std::vector<BYTE> queued(1000, b);
+        listener.pPipe->Write(queued.data(), static_cast<DWORD>(queued.size()));
+    }
+    listener.pPipe->Close();
+    // The close alone ends the pending write (the client reads nothing until then).
+    EXPECT_TRUE(listener.pSink->WaitForBroken(1));
+    EXPECT_TRUE(WaitForPipeRefs(listener.pPipe, 1)) << "the pending write did not complete";
+
+    // Whatever of the pending buffer got through, nothing queued behind it may follow.
+    std::vector<BYTE> rgb(big.size());
+    for (;;)
+    {
+        DWORD cbRead = 0;
+        HRESULT hr =
+            client.ReadMessage(rgb.data(), static_cast<DWORD>(rgb.size()), &cbRead, c_dwWaitMs);
+        if (hr != S_OK && hr != HRESULT_FROM_WIN32(ERROR_MORE_DATA))
+        {
+            EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_BROKEN_PIPE), hr);
+            break;
+        }
+        for (DWORD i = 0; i < cbRead; i++)
+        {
+            ASSERT_EQ(0xA1, rgb[i]) << "a queued buffer was written after the close";
+        }
+    }
+    CloseAndRelease(listener);
+}
+
+// A client message longer than the receive buffer ends that connection alone.
+TEST_F(AsyncPipeTest, OverlongMessageEndsOnlyItsConnection)
+{
+    std::wstring name = UniquePipeName(L"overlong");
+    Listener first = Listen(name, true);
+    CPipeClient clientFirst;
+    ASSERT_TRUE(ConnectTo(name, first, &clientFirst));
+    Listener second = Listen(name, true);
+    CPipeClient clientSecond;
+    ASSERT_TRUE(ConnectTo(name, second, &clientSecond));
+
+    std::vector<BYTE> overlong = Pattern(AsyncPipe::c_cbMaxMessage + 1, 4);
+    clientFirst.WriteMessage(overlong.data(), static_cast<DWORD>(overlong.size()), c_dwWaitMs);
+    ASSERT_TRUE(first.pSink->WaitForBroken(1));
+    EXPECT_TRUE(first.pSink->Messages().empty()) << "no part of the message is delivered";
+    EXPECT_TRUE(first.pSink->WaitForRefs(1));
+    BYTE rgb[16];
+    DWORD cbRead = 0;
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_BROKEN_PIPE),
+              clientFirst.ReadMessage(rgb, sizeof(rgb), &cbRead, c_dwWaitMs))
+        << "the service end of that connection is closed";
+
+    BYTE rgbHello[5] = {'h', 'e', 'l', 'l', 'o'};
+    ASSERT_EQ(S_OK, clientSecond.WriteMessage(rgbHello, sizeof(rgbHello), c_dwWaitMs));
+    ASSERT_EQ(S_OK, clientSecond.ReadMessage(rgb, sizeof(rgb), &cbRead, c_dwWaitMs));
+    EXPECT_EQ(5u, cbRead);
+    EXPECT_EQ(0, second.pSink->BrokenCount());
+
+    second.pSink->AddRef();
+    CloseAndRelease(first);
+    CloseAndRelease(second, 2);
+    EXPECT_EQ(1, second.pSink->BrokenCount());
+    second.pSink->Release();
+}
+
+// Closing a pipe nobody connected to (under Wine the pending connect ends with 676) is a
+// departure, never a fatal error: the owner gets its one break and both sinks back.
+TEST_F(AsyncPipeTest, ClosingListenerIsADeparture)
+{
+    std::wstring name = UniquePipeName(L"listener");
+    Listener listener = Listen(name);
+    listener.pSink->AddRef();
+    CloseAndRelease(listener, 2);
+    EXPECT_EQ(0, listener.pSink->ConnectedCount());
+    EXPECT_EQ(1, listener.pSink->BrokenCount());
+    listener.pSink->Release();
+
+    // The name is free again for the next listener.
+    Listener next = Listen(name, true);
+    CPipeClient client;
+    ASSERT_TRUE(ConnectTo(name, next, &client));
+    CloseAndRelease(next);
+}
+
+// Many connections at once, each echoing its own messages in the order sent.
+TEST_F(AsyncPipeTest, HundredInstancesEchoInOrder)
+{
+    const int c_cInstances = 100;
+    const int c_cMessages = 20;
+    std::wstring name = UniquePipeName(L"hundred");
+    std::vector<Listener> listeners;
+    for (int i = 0; i < c_cInstances; i++)
+    {
+        listeners.push_back(Listen(name, true));
+    }
+
+    std::atomic<int> cFailures{0};
+    std::vector<std::thread> clients;
+    for (int c = 0; c < c_cInstances; c++)
+    {
+        clients.emplace_back([&, c] {
+            CPipeClient client;
+            if (client.Connect(name.c_str(), c_dwWaitMs) != S_OK)
+            {
+                cFailures++;
+                return;
+            }
+            std::vector<std::vector<BYTE>> sent;
+            for (int m = 0; m < c_cMessages; m++)
+            {
+                std::vector<BYTE> message =
+                    Pattern(1 + (c * 37 + m * 101) % 1200, static_cast<BYTE>(c * c_cMessages + m));
+                message[0] = static_cast<BYTE>(m);
+                if (client.WriteMessage(message.data(), static_cast<DWORD>(message.size()),
+                                        c_dwWaitMs) != S_OK)
+                {
+                    cFailures++;
+                    return;
+                }
+                sent.push_back(message);
+            }
+            std::vector<BYTE> echo(AsyncPipe::c_cbMaxMessage);
+            for (int m = 0; m < c_cMessages; m++)
+            {
+                DWORD cbEcho = 0;
+                if (client.ReadMessage(echo.data(), static_cast<DWORD>(echo.size()), &cbEcho,
+                                       c_dwWaitMs) != S_OK ||
+                    std::vector<BYTE>(echo.begin(), echo.begin() + cbEcho) != sent[m])
+                {
+                    cFailures++;
+                    return;
+                }
+            }
+        });
+    }
+    for (std::thread &t : clients)
+    {
+        t.join();
+    }
+    EXPECT_EQ(0, cFailures.load());
+    int cConnected = 0;
+    for (const Listener &listener : listeners)
+    {
+        EXPECT_TRUE(listener.pSink->WaitForBroken(1)) << "every client has left";
+        cConnected += listener.pSink->ConnectedCount();
+    }
+    EXPECT_EQ(c_cInstances, cConnected);
+    for (const Listener &listener : listeners)
+    {
+        CloseAndRelease(listener);
+    }
+}
+
+// The pipe's descriptor comes from the security runtime, and the handle does not leak into
+// processes the service starts.
+TEST_F(AsyncPipeTest, SecuredByRuntimeDescriptorAndNotInherited)
+{
+    PSECURITY_DESCRIPTOR pDescriptor = reinterpret_cast<PSECURITY_DESCRIPTOR>(1);
+    EXPECT_EQ(E_INVALIDARG, QueryTransientObjectSecurityDescriptor(5, L"x", &pDescriptor));
+    EXPECT_EQ(nullptr, pDescriptor);
+    EXPECT_EQ(E_POINTER, QueryTransientObjectSecurityDescriptor(TRANSIENT_OBJECT_TYPE_NAMED_PIPE,
+                                                                L"x", nullptr));
+    ASSERT_EQ(S_OK, QueryTransientObjectSecurityDescriptor(TRANSIENT_OBJECT_TYPE_NAMED_PIPE,
+                                                           L"\\\\.\\pipe\\x", &pDescriptor));
+    ASSERT_TRUE(IsValidSecurityDescriptor(pDescriptor));
+    BOOL fPresent = FALSE;
+    BOOL fDefaulted = FALSE;
+    PACL pDacl = nullptr;
+    ASSERT_TRUE(GetSecurityDescriptorDacl(pDescriptor, &fPresent, &pDacl, &fDefaulted));
+    ASSERT_TRUE(fPresent && pDacl != nullptr) << "a null DACL would let anyone in";
+    // Everyone on the machine may read and write; network logons are denied.
+    bool fWorldReadWrite = false;
+    bool fNetworkDenied = false;
+    PSID pWorld = nullptr;
+    PSID pNetwork = nullptr;
+    ASSERT_TRUE(ConvertStringSidToSidW(L"S-1-1-0", &pWorld));
+    ASSERT_TRUE(ConvertStringSidToSidW(L"S-1-5-2", &pNetwork));
+    for (DWORD i = 0; i < pDacl->AceCount; i++)
+    {
+        ACE_HEADER *pAce = nullptr;
+        ASSERT_TRUE(GetAce(pDacl, i, reinterpret_cast<void **>(&pAce)));
+        if (pAce->AceType == ACCESS_ALLOWED_ACE_TYPE)
+        {
+            ACCESS_ALLOWED_ACE *pAllowed = reinterpret_cast<ACCESS_ALLOWED_ACE *>(pAce);
+            if (EqualSid(&pAllowed->SidStart, pWorld) &&
+                (pAllowed->Mask & (GENERIC_READ | GENERIC_WRITE)) == (GENERIC_READ | GENERIC_WRITE))
+            {
+                fWorldReadWrite = true;
+            }
+        }
+        else if (pAce->AceType == ACCESS_DENIED_ACE_TYPE)
+        {
+            ACCESS_DENIED_ACE *pDenied = reinterpret_cast<ACCESS_DENIED_ACE *>(pAce);
+            fNetworkDenied = fNetworkDenied || EqualSid(&pDenied->SidStart, pNetwork);
+        }
+    }
+    EXPECT_TRUE(fWorldReadWrite);
+    EXPECT_TRUE(fNetworkDenied);
+    LocalFree(pWorld);
+    LocalFree(pNetwork);
+    FreeTransientObjectSecurityDescriptor(pDescriptor);
+
+    // The handle value comes from the pipe's own debug line.
+    std::wstring name = UniquePipeName(L"handle");
+    Listener listener;
+    {
+        testsupport::LogCapture log;
+        listener = Listen(name);
+        for (const std::wstring &line : log.Lines())
+        {
+            size_t at = line.find(L"hPipe=");
+            if (at == std::wstring::npos)
+            {
+                continue;
+            }
+            HANDLE hPipe = ULongToHandle(wcstoul(line.c_str() + at + 6, nullptr, 16));
+            DWORD dwFlags = 0;
+            ASSERT_TRUE(GetHandleInformation(hPipe, &dwFlags));
+            EXPECT_EQ(0u, dwFlags & HANDLE_FLAG_INHERIT);
+            PACL pPipeDacl = nullptr;
+            PSECURITY_DESCRIPTOR pPipeDescriptor = nullptr;
+            EXPECT_EQ(ERROR_SUCCESS,
+                      GetSecurityInfo(hPipe, SE_KERNEL_OBJECT, DACL_SECURITY_INFORMATION, nullptr,
+                                      nullptr, &pPipeDacl, nullptr, &pPipeDescriptor));
+            ASSERT_NE(nullptr, pPipeDacl) << "the pipe was created with the runtime's DACL";
+            EXPECT_EQ(4, pPipeDacl->AceCount);
+            LocalFree(pPipeDescriptor);
+        }
+        EXPECT_TRUE(log.Contains(L"hPipe="));
+    }
+
+    CloseAndRelease(listener);
+}
+
+TEST(AsyncPipe, UnknownEventIsFatalErrorNamingThePipe)
+{
+    testsupport::FailureCapture failures;
+    AsyncPipe *pPipe = new AsyncPipe();
+    pPipe->Dispatch(77, 0, 0, 0);
+    EXPECT_TRUE(failures.Contains(L"AsyncPipe::Dispatch: Fatal error 0x4d from "
+                                  L"AsyncPipe::EventType 77"));
+    EXPECT_EQ(1u, failures.Count());
+    pPipe->Release();
+}
