@@ -61,8 +61,10 @@ telvane_build() {
 telvane_wine_start() {
   mkdir -p "$WINEPREFIX"
   (wineserver -p </dev/null >/dev/null 2>&1) || true  # already running is fine
-  wine wineboot --init </dev/null >/dev/null 2>&1 || true
-  if [ ! -f "$WINEPREFIX/system.reg" ]; then
+  # Plain wineboot: with --init an existing prefix was seen to end up with two services.exe,
+  # each with its own service database.
+  wine wineboot </dev/null >/dev/null 2>&1 || true
+  if [ ! -d "$WINEPREFIX/drive_c/windows" ]; then
     telvane_log "could not create the Wine prefix $WINEPREFIX"
     return 1
   fi

@@ -1,0 +1,251 @@
+// Installation through the prefix's real control manager, with test-only service and group
+// names so that these tests run beside everything else. The failure actions are checked at
+// the call: Wine accepts them and stores nothing.
+#include "servicelib/reghelper.h"
+#include "tests/common/testsupport.h"
+#include "tests/service/scmtesthelpers.h"
+#include "tests/service/testservice.h"
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <mutex>
+
+using testsupport::FailureCapture;
+
+namespace
+{
+struct CONFIG2_CALL
+{
+    DWORD dwInfoLevel = 0;
+    std::wstring wstrDescription;
+    DWORD dwResetPeriod = 0;
+    bool fRebootMessage = false;
+    bool fCommand = false;
+    std::vector<SC_ACTION> rgActions;
+};
+
+std::mutex s_callLock;
+std::vector<CONFIG2_CALL> s_rgCalls;
+
+BOOL WINAPI RecordConfig2(SC_HANDLE hService, DWORD dwInfoLevel, LPVOID pvInfo)
+{
+    CONFIG2_CALL call;
+    call.dwInfoLevel = dwInfoLevel;
+    if (dwInfoLevel == SERVICE_CONFIG_DESCRIPTION)
+    {
+        call.wstrDescription = static_cast<SERVICE_DESCRIPTIONW *>(pvInfo)->lpDescription;
+    }
+    else if (dwInfoLevel == SERVICE_CONFIG_FAILURE_ACTIONS)
+    {
+        const SERVICE_FAILURE_ACTIONSW *pActions = static_cast<SERVICE_FAILURE_ACTIONSW *>(pvInfo);
+        call.dwResetPeriod = pActions->dwResetPeriod;
+        call.fRebootMessage = pActions->lpRebootMsg != nullptr;
+        call.fCommand = pActions->lpCommand != nullptr;
+        call.rgActions.assign(pActions->lpsaActions, pActions->lpsaActions + pActions->cActions);
+    }
+    {
+        std::lock_guard<std::mutex> guard(s_callLock);
+        s_rgCalls.push_back(call);
+    }
+    return ChangeServiceConfig2W(hService, dwInfoLevel, pvInfo);
+}
+
+std::wstring ExePath()
+{
+    wchar_t wszPath[MAX_PATH];
+    GetModuleFileNameW(nullptr, wszPath, MAX_PATH);
+    return wszPath;
+}
+
+std::wstring ParametersKey(const std::wstring &wstrService)
+{
+    return L"SYSTEM\\CurrentControlSet\\Services\\" + wstrService + L"\\Parameters";
+}
+
+std::vector<std::wstring> GroupList(const std::wstring &wstrGroup)
+{
+    return RegHelperGetMultiString(c_wszSvchostGroupKey, wstrGroup.c_str());
+}
+
+bool GroupValueExists(const std::wstring &wstrGroup)
+{
+    DWORD dwType = 0;
+    std::wstring wstrData;
+    return scmtest::ReadRaw(c_wszSvchostGroupKey, wstrGroup.c_str(), &dwType, &wstrData);
+}
+
+// A demand-start test service with resource ids, removed again whatever the test did.
+class CInstallService : public CTestService
+{
+public:
+    // The control manager refuses a display name that another service has, and these
+    // services (in every test process) share the program's path: their ids must differ.
+    explicit CInstallService(const std::wstring &wstrName)
+        : CTestService(wstrName.c_str())
+    {
+        m_idsLocalizedName = static_cast<ULONG>(std::hash<std::wstring>()(wstrName) & 0x3FFFFFFE);
+        m_idsDescription = m_idsLocalizedName + 1;
+        m_ulStartType = SERVICE_DEMAND_START;
+    }
+    ~CInstallService() override { scmtest::StopAndDelete(ServiceName()); }
+};
+
+class ServiceInstall : public ::testing::Test
+{
+protected:
+    void SetUp() override
+    {
+        ASSERT_EQ(nullptr, CTestService::FirstService());
+        std::lock_guard<std::mutex> guard(s_callLock);
+        s_rgCalls.clear();
+        ServiceSetChangeConfig2Hook(RecordConfig2);
+    }
+    void TearDown() override
+    {
+        ServiceSetChangeConfig2Hook(nullptr);
+        CTestService::SetHostMode(false, nullptr, nullptr);
+    }
+};
+} // namespace
+
+TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
+{
+    FailureCapture failures;
+    CInstallService service(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CService::RegisterService(&service);
+    service.RegisterOneService();
+    ASSERT_EQ(0u, failures.Count());
+
+    std::wstring wstrExe = ExePath();
+    scmtest::SERVICE_RECORD record;
+    ASSERT_TRUE(scmtest::ReadRecord(service.ServiceName(), &record));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_DEMAND_START), record.dwStartType);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_ERROR_NORMAL), record.dwErrorControl);
+    EXPECT_EQ(wstrExe, record.wstrBinaryPath);
+    std::wstring wstrIds = L"@" + wstrExe + L",-";
+    EXPECT_EQ(wstrIds + std::to_wstring(service.m_idsLocalizedName), record.wstrDisplayName);
+    EXPECT_EQ(wstrIds + std::to_wstring(service.m_idsDescription), record.wstrDescription);
+    EXPECT_EQ(L"LocalSystem", record.wstrStartName);
+
+    std::vector<CONFIG2_CALL> rgCalls;
+    {
+        std::lock_guard<std::mutex> guard(s_callLock);
+        rgCalls = s_rgCalls;
+    }
+    ASSERT_EQ(2u, rgCalls.size());
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_CONFIG_DESCRIPTION), rgCalls[0].dwInfoLevel);
+    EXPECT_EQ(wstrIds + std::to_wstring(service.m_idsDescription), rgCalls[0].wstrDescription);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_CONFIG_FAILURE_ACTIONS), rgCalls[1].dwInfoLevel);
+    EXPECT_EQ(3600u, rgCalls[1].dwResetPeriod);
+    EXPECT_FALSE(rgCalls[1].fRebootMessage);
+    EXPECT_FALSE(rgCalls[1].fCommand);
+    ASSERT_EQ(10u, rgCalls[1].rgActions.size());
+    for (const SC_ACTION &action : rgCalls[1].rgActions)
+    {
+        EXPECT_EQ(SC_ACTION_RESTART, action.Type);
+        EXPECT_EQ(10000u, action.Delay);
+    }
+
+    // Registration removes an older installation first, then calls OnRegister.
+    EXPECT_EQ(1, service.m_cUnregisters);
+    EXPECT_EQ(1, service.m_cRegisters);
+
+    service.UnregisterOneService();
+    EXPECT_FALSE(scmtest::ServiceExists(service.ServiceName()));
+    EXPECT_EQ(2, service.m_cUnregisters);
+    // A second removal finds nothing and is not an error.
+    service.UnregisterOneService();
+    EXPECT_EQ(0u, failures.Count());
+}
+
+TEST_F(ServiceInstall, DefaultsAndSharedProcessForSeveralServices)
+{
+    CTestService plain(L"Plain");
+    EXPECT_EQ(static_cast<ULONG>(SERVICE_AUTO_START), plain.m_ulStartType);
+    EXPECT_EQ(static_cast<ULONG>(SC_ACTION_RESTART), plain.m_ulFailureAction);
+    EXPECT_EQ(0u, plain.m_idsLocalizedName);
+    EXPECT_EQ(0u, plain.m_idsDescription);
+
+    CInstallService first(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CInstallService second(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CService::RegisterService(&first);
+    CService::RegisterService(&second);
+    first.RegisterOneService();
+    scmtest::SERVICE_RECORD record;
+    ASSERT_TRUE(scmtest::ReadRecord(first.ServiceName(), &record));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
+    EXPECT_EQ(ExePath(), record.wstrBinaryPath);
+}
+
+TEST_F(ServiceInstall, ZeroResourceIdsStopAtTheAssertions)
+{
+    FailureCapture failures;
+    CTestService service(scmtest::UniqueName(L"TelvaneTestSvc").c_str());
+    CService::RegisterService(&service);
+    service.RegisterOneService();
+    EXPECT_EQ(2u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"Assertion failure: m_idsLocalizedName != 0"));
+    EXPECT_TRUE(failures.Contains(L"Assertion failure: m_idsDescription != 0"));
+    EXPECT_FALSE(scmtest::ServiceExists(service.ServiceName()));
+    EXPECT_EQ(0, service.m_cRegisters);
+    EXPECT_EQ(0, service.m_cUnregisters);
+}
+
+TEST_F(ServiceInstall, HostDllValuesAndGroupList)
+{
+    FailureCapture failures;
+    std::wstring wstrGroup = scmtest::UniqueName(L"TelvaneTestGroup");
+    CTestService::SetHostMode(true, wstrGroup.c_str(), nullptr);
+    // Someone else's service in the group stays where it is.
+    RegHelperSetMultiString(c_wszSvchostGroupKey, wstrGroup.c_str(), {L"Other"});
+
+    CInstallService alpha(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CInstallService beta(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CService::RegisterService(&alpha);
+    CService::RegisterService(&beta);
+    const std::wstring a = alpha.ServiceName();
+    const std::wstring b = beta.ServiceName();
+
+    alpha.RegisterOneService();
+    scmtest::SERVICE_RECORD record;
+    ASSERT_TRUE(scmtest::ReadRecord(a.c_str(), &record));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
+    EXPECT_EQ(L"svchost.exe -k " + wstrGroup, record.wstrBinaryPath);
+    // The host DLL is the module that holds the shell: here, the test program.
+    DWORD dwType = 0;
+    std::wstring wstrDll;
+    ASSERT_TRUE(scmtest::ReadRaw(ParametersKey(a), L"ServiceDll", &dwType, &wstrDll));
+    EXPECT_EQ(static_cast<DWORD>(REG_EXPAND_SZ), dwType);
+    EXPECT_EQ(ExePath() + std::wstring(1, L'\0'), wstrDll);
+    DWORD dwUnload = 0;
+    ASSERT_TRUE(scmtest::ReadDword(ParametersKey(a), L"ServiceDllUnloadOnStop", &dwUnload));
+    EXPECT_EQ(1u, dwUnload);
+    EXPECT_EQ((std::vector<std::wstring>{L"Other", a}), GroupList(wstrGroup));
+
+    beta.RegisterOneService();
+    EXPECT_EQ((std::vector<std::wstring>{L"Other", a, b}), GroupList(wstrGroup));
+    // Registering again replaces the entry instead of adding one.
+    alpha.RegisterOneService();
+    EXPECT_EQ((std::vector<std::wstring>{L"Other", b, a}), GroupList(wstrGroup));
+
+    alpha.UnregisterOneService();
+    EXPECT_FALSE(scmtest::ServiceExists(a.c_str()));
+    EXPECT_EQ((std::vector<std::wstring>{L"Other", b}), GroupList(wstrGroup));
+    beta.UnregisterOneService();
+    EXPECT_EQ((std::vector<std::wstring>{L"Other"}), GroupList(wstrGroup));
+
+    // The last service of a group takes the group's value with it.
+    RegHelperDeleteValue(c_wszSvchostGroupKey, wstrGroup.c_str());
+    alpha.RegisterOneService();
+    EXPECT_TRUE(GroupValueExists(wstrGroup));
+    alpha.UnregisterOneService();
+    EXPECT_FALSE(GroupValueExists(wstrGroup));
+
+    // Never installed: nothing to remove, and no error.
+    CInstallService never(scmtest::UniqueName(L"TelvaneTestSvc"));
+    never.UnregisterOneService();
+    EXPECT_FALSE(GroupValueExists(wstrGroup));
+    EXPECT_EQ(0u, failures.Count());
+}

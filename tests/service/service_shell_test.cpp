@@ -1,0 +1,529 @@
+// The service shell in-process: command lines, the service list, status reports, control
+// requests, the stop callback and console mode. What reaches the control manager is seen
+// through the status seam, since a status handle exists only inside a service process.
+#include "servicelib/diagnostics.h"
+#include "tests/common/testsupport.h"
+#include "tests/service/testservice.h"
+#include "tools/telvanehost/hoststopcallback.h"
+
+#include <gtest/gtest.h>
+
+#include <mutex>
+#include <thread>
+#include <vector>
+
+using testsupport::FailureCapture;
+using testsupport::LogCapture;
+
+namespace
+{
+const DWORD c_dwWaitMs = 10000;
+SERVICE_STATUS_HANDLE const c_hFakeStatus = reinterpret_cast<SERVICE_STATUS_HANDLE>(0x5eed);
+
+struct REPORT
+{
+    DWORD dwState;
+    DWORD dwCheckPoint;
+    DWORD dwWaitHint;
+};
+
+std::mutex s_reportLock;
+std::vector<REPORT> s_rgReports;
+
+BOOL WINAPI RecordReport(SERVICE_STATUS_HANDLE hStatus, LPSERVICE_STATUS pStatus)
+{
+    std::lock_guard<std::mutex> guard(s_reportLock);
+    s_rgReports.push_back({pStatus->dwCurrentState, pStatus->dwCheckPoint, pStatus->dwWaitHint});
+    return TRUE;
+}
+
+std::vector<REPORT> Reports()
+{
+    std::lock_guard<std::mutex> guard(s_reportLock);
+    return s_rgReports;
+}
+
+class ServiceShell : public ::testing::Test
+{
+protected:
+    void SetUp() override
+    {
+        ASSERT_EQ(nullptr, CTestService::FirstService()) << "a service leaked from a test";
+        std::lock_guard<std::mutex> guard(s_reportLock);
+        s_rgReports.clear();
+        ServiceSetStatusHook(RecordReport);
+    }
+    void TearDown() override
+    {
+        ServiceSetStatusHook(nullptr);
+        CTestService::SetHostMode(false, nullptr, nullptr);
+    }
+};
+
+DWORD ParseArgs(std::vector<const wchar_t *> rgArgs)
+{
+    std::vector<std::wstring> rgCopies(rgArgs.begin(), rgArgs.end());
+    std::vector<LPWSTR> rgArgv;
+    for (std::wstring &wstr : rgCopies)
+    {
+        rgArgv.push_back(&wstr[0]);
+    }
+    return CService::ParseCommandLine(static_cast<DWORD>(rgArgv.size()), rgArgv.data());
+}
+} // namespace
+
+TEST_F(ServiceShell, ParseCommandLineTable)
+{
+    CTestService alpha(L"Alpha");
+    CTestService beta(L"Beta");
+    CService::RegisterService(&alpha);
+    CService::RegisterService(&beta);
+    const ULONG a = alpha.m_ulServiceBit;
+    const ULONG b = beta.m_ulServiceBit;
+    ASSERT_EQ(1u, a);
+    ASSERT_EQ(2u, b);
+
+    struct
+    {
+        std::vector<const wchar_t *> rgArgs;
+        ULONG ulExpected;
+    } rgCases[] = {
+        {{}, 0x00FFFFFF},
+        {{L"run"}, 0x00FFFFFF},
+        {{L"run", L"Alpha"}, a},
+        {{L"run", L"aLPHA"}, a},
+        {{L"run", L"Alpha", L"BETA"}, a | b},
+        {{L"run", L"-r"}, 0x04FFFFFF},
+        {{L"run", L"/R"}, 0x04FFFFFF},
+        {{L"run", L"/register"}, 0x04FFFFFF},
+        {{L"run", L"-u"}, 0x08FFFFFF},
+        {{L"run", L"-r", L"-u"}, 0x0CFFFFFF},
+        {{L"run", L"-c"}, 0x01FFFFFF},
+        {{L"run", L"/D", L"Beta"}, 0x02000000 | b},
+        {{L"run", L"-e"}, 0x00FFFFFF},
+        {{L"run", L"-x"}, 0x10FFFFFF},
+        {{L"run", L"-"}, 0x10FFFFFF},
+        {{L"run", L"Gamma"}, 0x10FFFFFF},
+        {{L"run", L"Gamma", L"Alpha"}, 0x10000000 | a},
+        // Start parameters of a service: argv[0] is the service name and never counts.
+        {{L"Beta", L"-d"}, 0x02FFFFFF},
+    };
+    for (const auto &testCase : rgCases)
+    {
+        std::wstring wstrArgs;
+        for (const wchar_t *wsz : testCase.rgArgs)
+        {
+            wstrArgs += std::wstring(wsz) + L" ";
+        }
+        EXPECT_EQ(testCase.ulExpected, ParseArgs(testCase.rgArgs)) << testsupport::Narrow(wstrArgs);
+    }
+}
+
+TEST_F(ServiceShell, ListHandsOutBitsAndUnlinksOnDestruction)
+{
+    LogCapture log;
+    CTestService first(L"First");
+    CTestService second(L"Second");
+    CTestService *pThird = new CTestService(L"Third");
+    CService::RegisterService(&first);
+    CService::RegisterService(&second);
+    CService::RegisterService(pThird);
+    EXPECT_EQ(1u, first.m_ulServiceBit);
+    EXPECT_EQ(2u, second.m_ulServiceBit);
+    EXPECT_EQ(4u, pThird->m_ulServiceBit);
+    EXPECT_EQ(pThird, CTestService::FirstService());
+
+    // The destructor unlinks the service wherever it is in the list.
+    delete pThird;
+    EXPECT_EQ(&second, CTestService::FirstService());
+    EXPECT_EQ(&first, second.m_pNextService);
+
+    wchar_t wszExpected[128];
+    StringCchPrintf(wszExpected, 128, L"Successfully Unregistered CService=%p\r\n",
+                    static_cast<CService *>(&second));
+    second.UnregisterService();
+    EXPECT_TRUE(log.Contains(wszExpected));
+    EXPECT_EQ(&first, CTestService::FirstService());
+
+    // A service not in the list is left alone, with the first line only.
+    CTestService stray(L"Stray");
+    size_t cLines = log.Lines().size();
+    stray.UnregisterService();
+    ASSERT_EQ(cLines + 1, log.Lines().size());
+    EXPECT_NE(std::wstring::npos,
+              log.Lines().back().find(L"CService::UnregisterService: Attempting to Unregister"));
+    EXPECT_EQ(&first, CTestService::FirstService());
+
+    // Listing a service twice is refused without making the list a cycle.
+    FailureCapture failures;
+    CService::RegisterService(&first);
+    EXPECT_TRUE(failures.Contains(L"Assertion failure: s_pFirstService != pService && "
+                                  L"pService->m_pNextService == NULL"));
+    EXPECT_EQ(nullptr, first.m_pNextService);
+}
+
+TEST_F(ServiceShell, SetStatusCheckPointsAndNothingAfterStopped)
+{
+    LogCapture log;
+    CTestService service(L"Steady");
+    CService::RegisterService(&service);
+    service.m_hServiceStatus = c_hFakeStatus;
+
+    service.SetStatus(SERVICE_START_PENDING);
+    service.SetStatus(SERVICE_START_PENDING);
+    service.SetStatus(SERVICE_START_PENDING);
+    service.SetStatus(SERVICE_RUNNING);
+    service.SetStatus(SERVICE_STOPPED);
+    EXPECT_EQ(nullptr, service.m_hServiceStatus);
+    // Logged and kept, but never reported: the control manager is done with the service.
+    service.SetStatus(SERVICE_RUNNING);
+    service.SetStatus(SERVICE_RUNNING);
+
+    std::vector<REPORT> rgReports = Reports();
+    ASSERT_EQ(5u, rgReports.size());
+    DWORD rgExpected[5][2] = {{2, 0}, {2, 1}, {2, 2}, {4, 0}, {1, 0}};
+    for (size_t i = 0; i < 5; i++)
+    {
+        EXPECT_EQ(rgExpected[i][0], rgReports[i].dwState) << i;
+        EXPECT_EQ(rgExpected[i][1], rgReports[i].dwCheckPoint) << i;
+    }
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
+    EXPECT_EQ(1u, service.m_status.dwCheckPoint);
+    EXPECT_TRUE(log.Contains(L"CService::SetStatus: Steady is START_PENDING\r\n"));
+    EXPECT_TRUE(log.Contains(L"CService::SetStatus: Steady is STOPPED\r\n"));
+
+    // States outside 1..7 are refused and change nothing.
+    FailureCapture failures;
+    service.SetStatus(0);
+    service.SetStatus(8);
+    EXPECT_EQ(2u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"Assertion failure: 1 <= ulStatus && ulStatus <= 7"));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
+}
+
+TEST_F(ServiceShell, ControlHandlerDispatchesAndReportsAgain)
+{
+    CRecordingService service(L"Controlled");
+    CService::RegisterService(&service);
+    service.m_hServiceStatus = c_hFakeStatus;
+    service.SetStatus(SERVICE_RUNNING);
+    int iData = 0;
+
+    struct
+    {
+        DWORD dwControl;
+        DWORD dwEventType;
+        const wchar_t *wszExpected;
+    } rgCases[] = {
+        {SERVICE_CONTROL_PAUSE, 0, L"Pause"},
+        {SERVICE_CONTROL_CONTINUE, 0, L"Continue"},
+        {SERVICE_CONTROL_SHUTDOWN, 0, L"Shutdown"},
+        {SERVICE_CONTROL_DEVICEEVENT, 0x8000, L"DeviceEvent 32768"},
+        {SERVICE_CONTROL_POWEREVENT, 10, L"PowerEvent 10"},
+        {128, 0, L"Control 128"},
+        {255, 0, L"Control 255"},
+        {SERVICE_CONTROL_INTERROGATE, 0, L""},
+        {256, 0, L""},
+        {127, 0, L""},
+    };
+    for (const auto &testCase : rgCases)
+    {
+        service.m_wstrLast.clear();
+        size_t cReports = Reports().size();
+        EXPECT_EQ(static_cast<DWORD>(NO_ERROR),
+                  CService::ServiceControlHandler(testCase.dwControl, testCase.dwEventType, &iData,
+                                                  &service));
+        EXPECT_EQ(testCase.wszExpected, service.m_wstrLast) << testCase.dwControl;
+        // Every control is answered with the current status again.
+        ASSERT_EQ(cReports + 1, Reports().size()) << testCase.dwControl;
+        EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), Reports().back().dwState);
+    }
+    EXPECT_EQ(&iData, service.m_pvLastData);
+    EXPECT_EQ(0, service.m_cStops);
+}
+
+TEST_F(ServiceShell, DefaultHandlersAssert)
+{
+    FailureCapture failures;
+    CTestService service(L"Plain");
+    CService::RegisterService(&service);
+    DWORD rgControls[] = {SERVICE_CONTROL_PAUSE,      SERVICE_CONTROL_CONTINUE,
+                          SERVICE_CONTROL_SHUTDOWN,   SERVICE_CONTROL_DEVICEEVENT,
+                          SERVICE_CONTROL_POWEREVENT, 200};
+    for (DWORD dwControl : rgControls)
+    {
+        CService::ServiceControlHandler(dwControl, 0, nullptr, &service);
+    }
+    ASSERT_EQ(6u, failures.Count());
+    const wchar_t *rgHandlers[][2] = {
+        {L"m_fAcceptPauseContinue", L"OnPause"},    {L"m_fAcceptPauseContinue", L"OnContinue"},
+        {L"m_fAcceptShutdown", L"OnShutdown"},      {L"m_fAcceptDeviceEvents", L"OnDeviceEvent"},
+        {L"m_fAcceptPowerEvents", L"OnPowerEvent"}, {L"m_fAcceptControl", L"OnControl"},
+    };
+    for (const auto &handler : rgHandlers)
+    {
+        std::wstring wstrExpected = std::wstring(L"Assertion failure: false && \"When ") +
+                                    handler[0] + L" is true, you MUST override " + handler[1] +
+                                    L"\"";
+        EXPECT_TRUE(failures.Contains(wstrExpected)) << testsupport::Narrow(wstrExpected);
+    }
+}
+
+TEST_F(ServiceShell, StopWithoutHostRunsOnStopInTheHandler)
+{
+    CTestService service(L"Direct");
+    CService::RegisterService(&service);
+    service.m_hServiceStatus = c_hFakeStatus;
+    service.SetStatus(SERVICE_RUNNING);
+
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    EXPECT_EQ(1, service.m_cStops);
+    EXPECT_EQ(GetCurrentThreadId(), service.m_dwStopThread);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), Reports().back().dwState);
+    EXPECT_EQ(nullptr, service.m_hServiceStatus);
+}
+
+namespace
+{
+// ServiceMain's host path as far as it runs outside a service process: host globals with the
+// host's real stop callback, the stop event registered with it, and RUNNING reported. Returns
+// the result of the registration.
+DWORD RunAsHosted(CTestService &service, SVCHOST_GLOBAL_DATA &globals)
+{
+    globals.RegisterStopCallback = HostRegisterStopCallback;
+    CService::HostPushServiceGlobals(&service, L"TestGroup", &globals);
+    service.m_hStopEvent = CreateEventW(nullptr, FALSE, FALSE, nullptr);
+    DWORD dwResult = globals.RegisterStopCallback(&service.m_hStopWait, service.ServiceName(),
+                                                  service.m_hStopEvent,
+                                                  CService::StopCallbackStatic, &service, 0);
+    service.m_hServiceStatus = c_hFakeStatus;
+    service.SetStatus(SERVICE_RUNNING);
+    return dwResult;
+}
+} // namespace
+
+// The stop event and the host's stop callback, then STOP through the handler.
+TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
+{
+    FailureCapture failures;
+    SVCHOST_GLOBAL_DATA globals = {};
+    CTestService service(L"Hosted");
+    service.m_hStopEntered = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    service.m_hStopRelease = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    ASSERT_EQ(0u, RunAsHosted(service, globals));
+    EXPECT_EQ(&globals, CTestService::Globals());
+    EXPECT_TRUE(CTestService::Svchost());
+    EXPECT_STREQ(L"TestGroup", CTestService::Group());
+
+    // The handler only signals: it returns with RUNNING reported while OnStop still runs.
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(service.m_hStopEntered, c_dwWaitMs));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), Reports().back().dwState);
+    EXPECT_NE(GetCurrentThreadId(), service.m_dwStopThread);
+
+    SetEvent(service.m_hStopRelease);
+    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
+    EXPECT_EQ(1, service.m_cStops);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), Reports().back().dwState);
+    EXPECT_EQ(nullptr, service.m_hStopEvent);
+    EXPECT_EQ(nullptr, service.m_hStopWait);
+
+    // A STOP that arrives after the callback finds nothing to stop: no second OnStop, no
+    // SetEvent on the closed event.
+    size_t cReports = Reports().size();
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    EXPECT_EQ(1, service.m_cStops);
+    EXPECT_EQ(cReports, Reports().size());
+    EXPECT_EQ(0u, failures.Count());
+    CloseHandle(service.m_hStopEntered);
+    CloseHandle(service.m_hStopRelease);
+}
+
+namespace
+{
+// The stop-callback thread reports STOPPED while the dispatcher is inside its own report of
+// the same service; the dispatcher's report must not end after STOPPED.
+HANDLE s_hOnStopEntered = nullptr;
+HANDLE s_hStoppedReported = nullptr;
+DWORD s_dwHandlerThread = 0;
+volatile LONG s_cInReport = 0;
+volatile LONG s_fOverlap = 0;
+volatile LONG s_fReportAfterStopped = 0;
+volatile LONG s_fStoppedReported = 0;
+
+BOOL WINAPI RaceReport(SERVICE_STATUS_HANDLE hStatus, LPSERVICE_STATUS pStatus)
+{
+    if (InterlockedIncrement(&s_cInReport) > 1)
+    {
+        InterlockedExchange(&s_fOverlap, 1);
+    }
+    if (s_fStoppedReported)
+    {
+        InterlockedExchange(&s_fReportAfterStopped, 1);
+    }
+    if (GetCurrentThreadId() == s_dwHandlerThread)
+    {
+        // Give the stop thread every chance to report in the middle of this one.
+        WaitForSingleObject(s_hOnStopEntered, c_dwWaitMs);
+        WaitForSingleObject(s_hStoppedReported, 500);
+    }
+    if (pStatus->dwCurrentState == SERVICE_STOPPED)
+    {
+        InterlockedExchange(&s_fStoppedReported, 1);
+        SetEvent(s_hStoppedReported);
+    }
+    InterlockedDecrement(&s_cInReport);
+    return TRUE;
+}
+} // namespace
+
+TEST_F(ServiceShell, ReportsNeverOverlapTheStoppedReport)
+{
+    SVCHOST_GLOBAL_DATA globals = {};
+    CTestService service(L"Racing");
+    s_hOnStopEntered = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    s_hStoppedReported = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    service.m_hStopEntered = s_hOnStopEntered;
+    ASSERT_EQ(0u, RunAsHosted(service, globals));
+
+    s_dwHandlerThread = GetCurrentThreadId();
+    ServiceSetStatusHook(RaceReport);
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
+    ServiceSetStatusHook(RecordReport);
+
+    EXPECT_EQ(1, service.m_cStops);
+    EXPECT_EQ(1, s_fStoppedReported);
+    EXPECT_EQ(0, s_fOverlap);
+    EXPECT_EQ(0, s_fReportAfterStopped);
+    CloseHandle(s_hOnStopEntered);
+    CloseHandle(s_hStoppedReported);
+}
+
+TEST_F(ServiceShell, HostEntryPointsListTheServiceOnce)
+{
+    FailureCapture failures;
+    LogCapture log;
+    CTestService service(L"Entry");
+
+    // A host that never pushes globals calls ServiceMain first: the service is listed there
+    // and runs as a host DLL without a stop callback. A name it does not serve is answered
+    // without running anything.
+    wchar_t wszUnknown[] = L"Nobody";
+    LPWSTR rgArgv[] = {wszUnknown};
+    CService::HostServiceMain(&service, L"GroupOne", 1, rgArgv);
+    EXPECT_EQ(&service, CTestService::FirstService());
+    EXPECT_TRUE(CTestService::Svchost());
+    EXPECT_STREQ(L"GroupOne", CTestService::Group());
+    EXPECT_EQ(nullptr, CTestService::Globals());
+    EXPECT_TRUE(log.Contains(L"No service named Nobody in this module"));
+    EXPECT_EQ(0, service.m_cStarts);
+
+    // Pushing after that, or twice, keeps one entry.
+    CService::HostPushServiceGlobals(&service, L"GroupOne", nullptr);
+    CService::HostPushServiceGlobals(&service, L"GroupOne", nullptr);
+    EXPECT_EQ(&service, CTestService::FirstService());
+    EXPECT_EQ(nullptr, service.m_pNextService);
+    EXPECT_EQ(0u, failures.Count());
+}
+
+TEST_F(ServiceShell, ConsoleModeEndsWhenTheSelectedServicesStopThemselves)
+{
+    // Only the first is selected; the other never starts and must not keep console mode up.
+    CTestService quitter(L"Quitter", CTestService::StartMode::StopItself);
+    CTestService bystander(L"Bystander");
+    CService::RegisterService(&quitter);
+    CService::RegisterService(&bystander);
+
+    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    ULONG ulFlags = quitter.m_ulServiceBit;
+    std::thread console([&] {
+        CService::RunAsConsoleExe(ulFlags);
+        SetEvent(hDone);
+    });
+    DWORD dwWait = WaitForSingleObject(hDone, c_dwWaitMs);
+    if (dwWait != WAIT_OBJECT_0)
+    {
+        // Let the console thread go before failing.
+        CService::ConsoleCtrlHandler(CTRL_C_EVENT);
+    }
+    console.join();
+    CloseHandle(hDone);
+    EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
+    EXPECT_EQ(1, quitter.m_cStarts);
+    EXPECT_EQ(0, quitter.m_cStops);
+    EXPECT_EQ(0, bystander.m_cStarts);
+    EXPECT_EQ(nullptr, CTestService::ConsoleEvent());
+    // No status reaches the control manager in console mode.
+    EXPECT_TRUE(Reports().empty());
+}
+
+TEST_F(ServiceShell, ConsoleModeStopsRunningServicesOnCtrlC)
+{
+    FailureCapture failures;
+    CTestService runner(L"Runner");
+    CTestService quitter(L"Quitter", CTestService::StartMode::StopItself);
+    CService::RegisterService(&runner);
+    CService::RegisterService(&quitter);
+
+    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    DWORD dwConsoleThread = 0;
+    std::thread console([&] {
+        dwConsoleThread = GetCurrentThreadId();
+        CService::RunAsConsoleExe(CService::c_ulServiceMask);
+        SetEvent(hDone);
+    });
+    // One service stopping by itself is not the end while another runs.
+    for (int i = 0; i < 1000 && runner.m_status.dwCurrentState != SERVICE_RUNNING; i++)
+    {
+        Sleep(10);
+    }
+    ASSERT_EQ(static_cast<DWORD>(SERVICE_RUNNING), runner.m_status.dwCurrentState);
+    EXPECT_EQ(static_cast<DWORD>(WAIT_TIMEOUT), WaitForSingleObject(hDone, 200));
+
+    EXPECT_TRUE(CService::ConsoleCtrlHandler(CTRL_C_EVENT));
+    DWORD dwWait = WaitForSingleObject(hDone, c_dwWaitMs);
+    console.join();
+    CloseHandle(hDone);
+    ASSERT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
+    EXPECT_EQ(1, runner.m_cStops);
+    EXPECT_EQ(dwConsoleThread, runner.m_dwStopThread);
+    EXPECT_EQ(0, quitter.m_cStops);
+
+    // A late Ctrl+C after console mode closed its event is harmless.
+    EXPECT_TRUE(CService::ConsoleCtrlHandler(CTRL_C_EVENT));
+    EXPECT_EQ(0u, failures.Count());
+}
+
+// Outside a service process the control handler cannot be registered (a fatal error, seen
+// here as under a debugger), but the status ServiceMain prepares still shows.
+TEST_F(ServiceShell, ServiceMainPreparesTheStatusFromTheFlags)
+{
+    FailureCapture failures;
+    CTestService service(L"Flags");
+    service.m_fAcceptPauseContinue = true;
+    service.m_fAcceptPowerEvents = true;
+    service.m_fAcceptControl = true;
+    CService::RegisterService(&service);
+
+    wchar_t wszName[] = L"Flags";
+    LPWSTR rgArgv[] = {wszName};
+    service.ServiceMain(1, rgArgv);
+    for (int i = 0; i < 1000 && service.m_status.dwCurrentState != SERVICE_RUNNING; i++)
+    {
+        Sleep(10);
+    }
+    ASSERT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
+    EXPECT_EQ(1, service.m_cStarts);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), service.m_status.dwServiceType);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP | SERVICE_ACCEPT_PAUSE_CONTINUE |
+                                 SERVICE_ACCEPT_POWEREVENT),
+              service.m_status.dwControlsAccepted);
+    EXPECT_EQ(10000u, service.m_status.dwWaitHint);
+    // The flag that adds no accept bit is refused.
+    EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
+    EXPECT_TRUE(failures.Contains(L"Assertion failure: false"));
+    EXPECT_EQ(2u, failures.Count());
+    // No stop event without host globals.
+    EXPECT_EQ(nullptr, service.m_hStopEvent);
+}
