@@ -117,8 +117,8 @@ public:
     ULONG Release(ULONG ulTag);
 
     // Moves the object's node to the end of the array and releases the caller's tag-0
-    // reference on the object, also when the move fails (E_POINTER, E_UNEXPECTED); the
-    // object is only released afterwards, never added to.
+    // reference on the object, also when the move fails (E_UNEXPECTED); the object is
+    // only released afterwards, never added to.
     HRESULT AddObject(CJsonObject *pObject);
 
     long TagCount(ULONG ulTag) const { return m_refs.TagCount(ulTag); }
