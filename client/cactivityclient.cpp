@@ -11,6 +11,11 @@ CActivityClient::CActivityClient(DWORD dwTimeoutMs)
 
 HRESULT CActivityClient::Connect(const wchar_t *wszPipeName)
 {
+    // A live connection keeps its state: forgetting the start would allow a second one.
+    if (m_pipe.IsOpen())
+    {
+        return HRESULT_FROM_WIN32(ERROR_INVALID_STATE);
+    }
     m_fStarted = false;
     return m_pipe.Open(wszPipeName, m_dwTimeoutMs, &m_dwServiceVersion);
 }

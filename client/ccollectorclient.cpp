@@ -12,6 +12,11 @@ CCollectorClient::CCollectorClient(DWORD dwTimeoutMs)
 
 HRESULT CCollectorClient::Connect(const wchar_t *wszPipeName)
 {
+    // A live connection keeps its state: its registration, and a request awaiting its answer.
+    if (m_pipe.IsOpen())
+    {
+        return HRESULT_FROM_WIN32(ERROR_INVALID_STATE);
+    }
     m_fRegistered = false;
     m_fRequestOpen = false;
     return m_pipe.Open(wszPipeName, m_dwTimeoutMs, &m_dwServiceVersion);

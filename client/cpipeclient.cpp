@@ -57,7 +57,7 @@ HRESULT CPipeClient::Connect(const wchar_t *wszPipeName, DWORD dwTimeoutMs)
     {
         // Identification only: the service has no business acting as this client.
         HANDLE hPipe = CreateFileW(
-            wszPipeName, GENERIC_READ | GENERIC_WRITE, 0, nullptr, OPEN_EXISTING,
+            wszPipeName, c_dwTelvaneClientPipeAccess, 0, nullptr, OPEN_EXISTING,
             FILE_FLAG_OVERLAPPED | SECURITY_SQOS_PRESENT | SECURITY_IDENTIFICATION, nullptr);
         if (hPipe != INVALID_HANDLE_VALUE)
         {
@@ -178,8 +178,12 @@ HRESULT CPipeClient::WriteParts(const void *pvHeader, DWORD cbHeader, DWORD ibCo
         return HRESULT_FROM_WIN32(ERROR_MESSAGE_EXCEEDS_MAX_SIZE);
     }
     BYTE rgbPart[TELVANE_MAX_MESSAGE] = {};
-    if (cbHeader + cbMaxPart + cbTrailer > sizeof(rgbPart) || ibComplete + 4 > cbHeader ||
-        ibLength + 4 > cbHeader)
+    // Summed in 64 bits: a size near 2^32 must not wrap round and pass for a small one. Parts
+    // that may carry nothing would never finish an item that has bytes.
+    const ULONGLONG cbLayout = static_cast<ULONGLONG>(cbHeader) + cbMaxPart + cbTrailer;
+    if (pvHeader == nullptr || cbLayout > sizeof(rgbPart) ||
+        static_cast<ULONGLONG>(ibComplete) + sizeof(DWORD) > cbHeader ||
+        static_cast<ULONGLONG>(ibLength) + sizeof(DWORD) > cbHeader || (cbMaxPart == 0 && cb != 0))
     {
         return E_INVALIDARG;
     }
@@ -231,11 +235,14 @@ HRESULT CPipeClient::WaitIo(BOOL fResult, OVERLAPPED *pOverlapped, DWORD *pcbTra
     if (!fResult)
     {
         DWORD dwError = GetLastError();
-        if (dwError != ERROR_IO_PENDING)
+        // A read of a message longer than the buffer filled it at once; how much it delivered
+        // is in the operation's result, collected below like any completion's.
+        if (dwError != ERROR_IO_PENDING && dwError != ERROR_MORE_DATA)
         {
             return PipeClientResult(dwError);
         }
-        if (WaitForSingleObject(pOverlapped->hEvent, dwTimeoutMs) != WAIT_OBJECT_0)
+        if (dwError == ERROR_IO_PENDING &&
+            WaitForSingleObject(pOverlapped->hEvent, dwTimeoutMs) != WAIT_OBJECT_0)
         {
             // The operation may still finish as it is cancelled; then its result stands.
             CancelIoEx(m_hPipe.Get(), pOverlapped);

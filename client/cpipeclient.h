@@ -7,13 +7,19 @@
 //   HRESULT_FROM_WIN32(ERROR_INVALID_DATA)     the service sent something the protocol does not
 //   HRESULT_FROM_WIN32(ERROR_INVALID_STATE)    the call does not fit the connection's state
 //   HRESULT_FROM_WIN32(ERROR_MESSAGE_EXCEEDS_MAX_SIZE)  an event or result over TELVANE_MAX_ITEM
-//   E_INVALIDARG                               a null pointer with a non-zero size
+//   E_INVALIDARG                               a null pointer with a non-zero size, or a part
+//                                              layout that does not fit one message
 #pragma once
 
 #include <windows.h>
 
 // Default time limit of each client call.
 const DWORD c_dwTelvaneClientTimeoutMs = 5000;
+
+// What a client opens a pipe with: reading and writing messages, and setting the read mode.
+// Not GENERIC_WRITE: on a pipe that includes the right to create instances of it, which the
+// service's pipes grant nobody but the system and administrators.
+const DWORD c_dwTelvaneClientPipeAccess = GENERIC_READ | FILE_WRITE_DATA | FILE_WRITE_ATTRIBUTES;
 
 // Owns one handle; closes it when it goes.
 class CClientHandle
@@ -56,7 +62,8 @@ public:
     // Sends an item of any size as consecutive part messages: each is the header with its
     // complete field (at ibComplete: 0, or 1 on the last part) and length field (at ibLength)
     // filled in, up to cbMaxPart bytes of the item, then cbTrailer zero bytes. An empty item
-    // is one last part.
+    // is one last part. Header, cbMaxPart and trailer must fit one message, and cbMaxPart may
+    // be 0 only for an empty item.
     HRESULT WriteParts(const void *pvHeader, DWORD cbHeader, DWORD ibComplete, DWORD ibLength,
                        DWORD cbTrailer, DWORD cbMaxPart, const void *pv, size_t cb,
                        DWORD dwTimeoutMs);

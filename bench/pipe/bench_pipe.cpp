@@ -3,6 +3,7 @@
 // in the same run on the same machine: the platform's own limit. 1 and 8 concurrent clients,
 // small and full-size messages; the clients are the same plain blocking writers in both.
 #include "servicelib/asyncpipe.h"
+#include "client/cpipeclient.h"
 
 #include <atomic>
 #include <stdio.h>
@@ -84,8 +85,8 @@ HANDLE BenchConnect(const std::wstring &name)
 {
     for (int i = 0; i < 2000; i++)
     {
-        HANDLE h = CreateFileW(name.c_str(), GENERIC_READ | GENERIC_WRITE, 0, nullptr,
-                               OPEN_EXISTING, 0, nullptr);
+        HANDLE h = CreateFileW(name.c_str(), c_dwTelvaneClientPipeAccess, 0, nullptr, OPEN_EXISTING,
+                               0, nullptr);
         if (h != INVALID_HANDLE_VALUE)
         {
             DWORD dwMode = PIPE_READMODE_MESSAGE;

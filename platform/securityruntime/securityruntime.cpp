@@ -4,9 +4,12 @@
 
 namespace
 {
-// Every local process may read and write the pipe; the system and administrators have full
-// control; network logons are refused outright (the pipes also reject remote clients).
-const wchar_t c_wszPipeDescriptor[] = L"D:(D;;GA;;;NU)(A;;GA;;;SY)(A;;GA;;;BA)(A;;GRGW;;;WD)";
+// Every local process may read and write the pipe and set its read mode (0x12018b: generic
+// read, write data, write attributes); the system and administrators have full control;
+// network logons are refused outright (the pipes also reject remote clients). Generic write
+// would include the append right, which on a pipe is the right to create an instance of it:
+// any process could then serve the pipe's name to the service's clients.
+const wchar_t c_wszPipeDescriptor[] = L"D:(D;;GA;;;NU)(A;;GA;;;SY)(A;;GA;;;BA)(A;;0x12018b;;;WD)";
 } // namespace
 
 extern "C" HRESULT WINAPI QueryTransientObjectSecurityDescriptor(

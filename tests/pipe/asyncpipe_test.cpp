@@ -386,8 +386,9 @@ TEST_F(AsyncPipeTest, HundredInstancesEchoInOrder)
     }
 }
 
-// The pipe's descriptor comes from the security runtime, and the handle does not leak into
-// processes the service starts.
+// The pipe's descriptor comes from the security runtime, lets local clients in and nobody but
+// the system and administrators serve the pipe, and the handle does not leak into processes
+// the service starts.
 TEST_F(AsyncPipeTest, SecuredByRuntimeDescriptorAndNotInherited)
 {
     PSECURITY_DESCRIPTOR pDescriptor = reinterpret_cast<PSECURITY_DESCRIPTOR>(1);
@@ -403,8 +404,16 @@ TEST_F(AsyncPipeTest, SecuredByRuntimeDescriptorAndNotInherited)
     PACL pDacl = nullptr;
     ASSERT_TRUE(GetSecurityDescriptorDacl(pDescriptor, &fPresent, &pDacl, &fDefaulted));
     ASSERT_TRUE(fPresent && pDacl != nullptr) << "a null DACL would let anyone in";
-    // Everyone on the machine may read and write; network logons are denied.
-    bool fWorldReadWrite = false;
+    // Everyone on the machine gets what a client asks for, and not the right to create
+    // instances of the pipe (for a pipe that is the append right within generic write): with
+    // it any local process could serve the service's pipe name to the service's clients.
+    // Network logons are denied. Wine enforces none of this, so the rights are read here.
+    GENERIC_MAPPING mapping = {FILE_GENERIC_READ, FILE_GENERIC_WRITE, FILE_GENERIC_EXECUTE,
+                               FILE_ALL_ACCESS};
+    DWORD dwClientAccess = c_dwTelvaneClientPipeAccess;
+    MapGenericMask(&dwClientAccess, &mapping);
+    EXPECT_EQ(0u, dwClientAccess & FILE_CREATE_PIPE_INSTANCE);
+    DWORD dwWorldAccess = 0;
     bool fNetworkDenied = false;
     PSID pWorld = nullptr;
     PSID pNetwork = nullptr;
@@ -417,10 +426,11 @@ TEST_F(AsyncPipeTest, SecuredByRuntimeDescriptorAndNotInherited)
         if (pAce->AceType == ACCESS_ALLOWED_ACE_TYPE)
         {
             ACCESS_ALLOWED_ACE *pAllowed = reinterpret_cast<ACCESS_ALLOWED_ACE *>(pAce);
-            if (EqualSid(&pAllowed->SidStart, pWorld) &&
-                (pAllowed->Mask & (GENERIC_READ | GENERIC_WRITE)) == (GENERIC_READ | GENERIC_WRITE))
+            if (EqualSid(&pAllowed->SidStart, pWorld))
             {
-                fWorldReadWrite = true;
+                DWORD dwMask = pAllowed->Mask;
+                MapGenericMask(&dwMask, &mapping);
+                dwWorldAccess |= dwMask;
             }
         }
         else if (pAce->AceType == ACCESS_DENIED_ACE_TYPE)
@@ -429,7 +439,8 @@ TEST_F(AsyncPipeTest, SecuredByRuntimeDescriptorAndNotInherited)
             fNetworkDenied = fNetworkDenied || EqualSid(&pDenied->SidStart, pNetwork);
         }
     }
-    EXPECT_TRUE(fWorldReadWrite);
+    EXPECT_EQ(dwClientAccess, dwWorldAccess & dwClientAccess) << "a client could not open the pipe";
+    EXPECT_EQ(0u, dwWorldAccess & FILE_CREATE_PIPE_INSTANCE) << "anyone could serve the pipe";
     EXPECT_TRUE(fNetworkDenied);
     LocalFree(pWorld);
     LocalFree(pNetwork);

@@ -237,3 +237,146 @@ TEST_F(TelvaneClientTest, FailuresComeBackAsHResultsWithinTheirLimits)
               collector.WaitForRequest(&activityId, &logId, c_dwWaitMs));
     pServer->Release();
 }
+
+// A second Connect on a live connection is refused and leaves that connection as it was: the
+// client must not forget that it started or registered (the service closes the pipe on a
+// second start or registration) nor that a request still waits for its answer.
+TEST_F(TelvaneClientTest, ConnectOnALiveConnectionKeepsItsState)
+{
+    const HRESULT hrInvalidState = HRESULT_FROM_WIN32(ERROR_INVALID_STATE);
+
+    std::wstring activityName = UniquePipeName(L"again-activity");
+    CTestPipeServer *pActivityServer = CTestPipeServer::Start(false, activityName);
+    CActivityClient activity;
+    ASSERT_EQ(S_OK, activity.Connect(activityName.c_str()));
+    ASSERT_EQ(S_OK, activity.Start(TestGuid(1), TestGuid(2)));
+    EXPECT_EQ(hrInvalidState, activity.Connect(activityName.c_str()));
+    EXPECT_EQ(hrInvalidState, activity.Start(TestGuid(1), TestGuid(2)));
+    EXPECT_EQ(S_OK, activity.SendEvent(TestGuid(3), "e", 1)) << "still started";
+    ASSERT_EQ(S_OK, activity.Stop());
+    ASSERT_TRUE(pActivityServer->WaitForEnd());
+    EXPECT_EQ(1u, pActivityServer->Items().size());
+    EXPECT_EQ(4u, pActivityServer->Messages().size()) << "version reply, one start, event, stop";
+    pActivityServer->Finish();
+
+    std::wstring collectorName = UniquePipeName(L"again-collector");
+    CTestPipeServer *pCollectorServer = CTestPipeServer::Start(true, collectorName);
+    CCollectorClient collector;
+    ASSERT_EQ(S_OK, collector.Connect(collectorName.c_str()));
+    ASSERT_EQ(S_OK, collector.Register(TestGuid(4)));
+    pCollectorServer->SendStartCollection(TestGuid(5), TestGuid(6));
+    GUID activityId;
+    GUID logId;
+    ASSERT_EQ(S_OK, collector.WaitForRequest(&activityId, &logId, c_dwWaitMs));
+    EXPECT_EQ(hrInvalidState, collector.Connect(collectorName.c_str()));
+    EXPECT_EQ(hrInvalidState, collector.Register(TestGuid(4)));
+    EXPECT_EQ(S_OK, collector.SendResult("r", 1)) << "the request taken is still open";
+    EXPECT_TRUE(pCollectorServer->WaitForItems(1));
+    ASSERT_EQ(S_OK, collector.BreakPipe());
+    ASSERT_TRUE(pCollectorServer->WaitForEnd());
+    EXPECT_EQ(4u, pCollectorServer->Messages().size())
+        << "version reply, one registration, result, break";
+    pCollectorServer->Finish();
+}
+
+// A message longer than the caller's buffer fills the buffer and says how many bytes it
+// delivered, also when the message is already waiting and the read completes at once; the
+// rest follows on the next reads.
+TEST_F(TelvaneClientTest, ReadOfALongerMessageReportsWhatItDelivered)
+{
+    std::wstring name = UniquePipeName(L"moredata");
+    Listener listener = ListenRaw(name);
+    CPipeClient client;
+    ASSERT_EQ(S_OK, client.Connect(name.c_str(), c_dwWaitMs));
+    ASSERT_TRUE(listener.pSink->WaitForConnected(1));
+    std::vector<BYTE> message = Pattern(10, 0x31);
+    listener.pPipe->Write(message.data(), static_cast<DWORD>(message.size()));
+
+    // The first read may wait for the message; once part of it is read, the rest is waiting.
+    std::vector<BYTE> received;
+    const HRESULT rghrExpected[] = {HRESULT_FROM_WIN32(ERROR_MORE_DATA),
+                                    HRESULT_FROM_WIN32(ERROR_MORE_DATA), S_OK};
+    for (HRESULT hrExpected : rghrExpected)
+    {
+        BYTE rgb[4] = {};
+        DWORD cbRead = 0xFFFF;
+        EXPECT_EQ(hrExpected, client.ReadMessage(rgb, sizeof(rgb), &cbRead, c_dwWaitMs));
+        ASSERT_LE(cbRead, sizeof(rgb));
+        received.insert(received.end(), rgb, rgb + cbRead);
+    }
+    EXPECT_EQ(message, received);
+    client.Close();
+    CloseRaw(listener);
+}
+
+// Part layouts that do not fit one message are refused before anything is copied or sent: a
+// size that wraps round in 32 bits must not pass for a small one, and parts that may carry
+// nothing would never finish the item.
+TEST_F(TelvaneClientTest, WritePartsRefusesLayoutsThatDoNotFitAMessage)
+{
+    std::wstring name = UniquePipeName(L"layout");
+    CTestPipeServer *pServer = CTestPipeServer::Start(true, name);
+    CPipeClient client;
+    ASSERT_EQ(S_OK, client.Open(name.c_str(), c_dwWaitMs));
+
+    // Were a layout to slip through, the item would go out for real: end the connection after
+    // the time limit so that a part loop without end still returns.
+    HANDLE hReturned = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    std::thread watchdog([&] {
+        if (WaitForSingleObject(hReturned, c_dwWaitMs) != WAIT_OBJECT_0)
+        {
+            pServer->Shutdown();
+        }
+    });
+
+    const TELVANE_COLLECTION_COMPLETE header = {TELVANE_COLLECTION_COMPLETE_OPCODE, 0, 0};
+    const DWORD ibComplete = offsetof(TELVANE_COLLECTION_COMPLETE, Complete);
+    const DWORD ibLength = offsetof(TELVANE_COLLECTION_COMPLETE, Length);
+    std::vector<BYTE> item = Pattern(5000, 0x21);
+    struct Layout
+    {
+        DWORD ibComplete;
+        DWORD ibLength;
+        DWORD cbTrailer;
+        DWORD cbMaxPart;
+    };
+    const Layout rgBad[] = {
+        {ibComplete, ibLength, 0, 0xFFFFFFF8},                  // 12 + this is 4 in 32 bits
+        {ibComplete, ibLength, 0xFFFFFFF8, 100},                // likewise the trailer
+        {0xFFFFFFFE, ibLength, 0, 100},                         // + 4 is 2 in 32 bits
+        {ibComplete, 0xFFFFFFFD, 0, 100},                       // + 4 is 1 in 32 bits
+        {ibComplete, ibLength, 0, 0},                           // empty parts without end
+        {ibComplete, ibLength, 0, TELVANE_MAX_RESULT_PART + 1}, // one byte too many
+    };
+    for (const Layout &layout : rgBad)
+    {
+        EXPECT_EQ(E_INVALIDARG,
+                  client.WriteParts(&header, sizeof(header), layout.ibComplete, layout.ibLength,
+                                    layout.cbTrailer, layout.cbMaxPart, item.data(), item.size(),
+                                    c_dwWaitMs))
+            << layout.ibComplete << " " << layout.ibLength << " " << layout.cbTrailer << " "
+            << layout.cbMaxPart;
+    }
+    EXPECT_EQ(E_INVALIDARG,
+              client.WriteParts(nullptr, sizeof(header), ibComplete, ibLength, 0,
+                                TELVANE_MAX_RESULT_PART, item.data(), item.size(), c_dwWaitMs))
+        << "no header to copy";
+    // An empty item needs no payload room at all, and the connection was never disturbed.
+    EXPECT_EQ(S_OK, client.WriteParts(&header, sizeof(header), ibComplete, ibLength, 0, 0, nullptr,
+                                      0, c_dwWaitMs));
+    EXPECT_EQ(S_OK,
+              client.WriteParts(&header, sizeof(header), ibComplete, ibLength, 0,
+                                TELVANE_MAX_RESULT_PART, item.data(), item.size(), c_dwWaitMs));
+    SetEvent(hReturned);
+    watchdog.join();
+    CloseHandle(hReturned);
+
+    ASSERT_TRUE(pServer->WaitForItems(2));
+    std::vector<ReceivedItem> items = pServer->Items();
+    EXPECT_TRUE(items[0].vb.empty());
+    EXPECT_EQ(item, items[1].vb);
+    EXPECT_EQ(1u + 1 + PartCount(item.size(), TELVANE_MAX_RESULT_PART), pServer->Messages().size())
+        << "version reply and the two items' parts only";
+    client.Close();
+    pServer->Finish();
+}

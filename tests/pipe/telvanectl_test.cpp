@@ -91,6 +91,26 @@ TEST(Telvanectl, PrintsUsageOnBadArguments)
         EXPECT_NE(std::string::npos, result.strOutput.find("usage: telvanectl activity"))
             << result.strOutput;
     }
+
+    // A sign or a value past 32 bits is no number of milliseconds or requests: read leniently,
+    // "-1" would become a wait without end on a pipe nobody serves.
+    std::wstring none = UniquePipeName(L"ctlnumbers");
+    const wchar_t *rgwszNumbers[] = {
+        L"activity --timeout -1",
+        L"activity --timeout 4294967296",
+        L"activity --timeout 99999999999999999999999",
+        L"collector --timeout 100 --requests -2",
+    };
+    for (const wchar_t *wszNumbers : rgwszNumbers)
+    {
+        std::wstring args =
+            std::wstring(wszNumbers) + L" --pipe " + none + L" " +
+            (wszNumbers[0] == L'a' ? std::wstring(c_wszActivityId) + L" " + c_wszLogId
+                                   : std::wstring(c_wszCollectorId) + L" x");
+        ChildResult result = RunChild(Tool() + L" " + args, {}, pipetest::c_dwWaitMs);
+        EXPECT_FALSE(result.fTimedOut) << testsupport::Narrow(args);
+        EXPECT_EQ(2u, result.dwExitCode) << testsupport::Narrow(args) << "\n" << result.strOutput;
+    }
 }
 
 TEST(Telvanectl, ActivitySendsStartEventsAndStop)

@@ -61,15 +61,25 @@ int CtlFailed(const char *szStep, HRESULT hr)
     return c_iExitFailed;
 }
 
+// Decimal digits only. wcstoul alone would take "-1" as its negation, INFINITE for a time
+// limit, and quietly saturate a value past 32 bits.
 bool CtlParseNumber(const wchar_t *wsz, DWORD *pdw)
 {
-    wchar_t *pwszEnd = nullptr;
-    unsigned long ul = wcstoul(wsz, &pwszEnd, 10);
-    if (*wsz == L'\0' || *pwszEnd != L'\0' || ul > 0xFFFFFFFFul)
+    ULONGLONG ull = 0;
+    const wchar_t *pwch = wsz;
+    for (; *pwch >= L'0' && *pwch <= L'9'; pwch++)
+    {
+        ull = ull * 10 + static_cast<ULONGLONG>(*pwch - L'0');
+        if (ull > 0xFFFFFFFFull)
+        {
+            return false;
+        }
+    }
+    if (pwch == wsz || *pwch != L'\0')
     {
         return false;
     }
-    *pdw = static_cast<DWORD>(ul);
+    *pdw = static_cast<DWORD>(ull);
     return true;
 }
 
