@@ -265,15 +265,19 @@ void CService::ServiceMain(DWORD argc, LPWSTR *argv)
         {
             FATAL_ERROR(L"CService::ServiceMain", L"CreateEvent", GetLastError());
         }
-        AcquireSRWLockExclusive(&m_srwStatus);
-        m_hStopEvent = hStopEvent;
-        ReleaseSRWLockExclusive(&m_srwStatus);
+        // The stop callback of a previous run may still be clearing these fields: both are
+        // stored under the lock. The event cannot fire before the control handler exists.
+        HANDLE hStopWait = nullptr;
         DWORD dwResult = s_pSvchostGlobals->RegisterStopCallback(
-            &m_hStopWait, m_wszServiceName, m_hStopEvent, StopCallbackStatic, this, 0);
+            &hStopWait, m_wszServiceName, hStopEvent, StopCallbackStatic, this, 0);
         if (dwResult != 0)
         {
             FATAL_ERROR(L"CService::ServiceMain", L"RegisterStopCallback", dwResult);
         }
+        AcquireSRWLockExclusive(&m_srwStatus);
+        m_hStopEvent = hStopEvent;
+        m_hStopWait = hStopWait;
+        ReleaseSRWLockExclusive(&m_srwStatus);
     }
 
     SERVICE_STATUS_HANDLE hStatus =
@@ -376,7 +380,10 @@ DWORD WINAPI CService::ServiceControlHandler(DWORD dwControl, DWORD dwEventType,
         pService->OnPowerEvent(dwEventType, pvEventData);
         break;
     default:
-        if (dwControl >= 128 && dwControl <= 255)
+        // The control manager passes user-defined controls from any client with the right
+        // to send them, whatever the service accepts; one that never asked for them must not
+        // end up in the default OnControl, whose assertion would end the host process.
+        if (dwControl >= 128 && dwControl <= 255 && pService->m_fAcceptControl)
         {
             pService->OnControl(dwControl, pvEventData);
         }
@@ -455,18 +462,30 @@ void CService::SetStatus(ULONG ulStatus)
 VOID CALLBACK CService::StopCallbackStatic(PVOID pvContext, BOOLEAN fTimedOut)
 {
     CService *pService = static_cast<CService *>(pvContext);
+    // Once OnStop has reported STOPPED, a host that keeps its process for other services may
+    // start this one again on another thread, and ServiceMain then stores a new event and
+    // wait: only the ones this callback belongs to are dropped here. Nothing writes them
+    // before that STOPPED, so they are read without the lock the dispatcher may hold.
+    HANDLE hStopEvent = pService->m_hStopEvent;
+    HANDLE hStopWait = pService->m_hStopWait;
+
     pService->OnStop();
 
     // From inside its own callback the wait cannot be waited for: 997 is the expected answer.
-    if (!UnregisterWaitEx(pService->m_hStopWait, nullptr) && GetLastError() != ERROR_IO_PENDING)
+    if (!UnregisterWaitEx(hStopWait, nullptr) && GetLastError() != ERROR_IO_PENDING)
     {
         FATAL_ERROR(L"CService::StopCallbackStatic", L"UnregisterWaitEx", GetLastError());
     }
-    pService->m_hStopWait = nullptr;
 
     AcquireSRWLockExclusive(&pService->m_srwStatus);
-    HANDLE hStopEvent = pService->m_hStopEvent;
-    pService->m_hStopEvent = nullptr;
+    if (pService->m_hStopWait == hStopWait)
+    {
+        pService->m_hStopWait = nullptr;
+    }
+    if (pService->m_hStopEvent == hStopEvent)
+    {
+        pService->m_hStopEvent = nullptr;
+    }
     ReleaseSRWLockExclusive(&pService->m_srwStatus);
     if (!CloseHandle(hStopEvent))
     {

@@ -121,9 +121,10 @@ protected:
     HANDLE m_hStopEvent;
     HANDLE m_hStopWait;
     ULONG m_ulServiceBit;
-    // Guards m_status, m_hServiceStatus and m_hStopEvent between the dispatcher thread and
-    // the threads that report status, so that nothing reaches the control manager after
-    // STOPPED and no stop request lands on a closed event.
+    // Guards m_status, m_hServiceStatus, m_hStopEvent and m_hStopWait between the dispatcher
+    // thread and the threads that report status or stop, so that nothing reaches the control
+    // manager after STOPPED, no stop request lands on a closed event, and a stop callback
+    // never drops the event and wait of the start that follows it.
     SRWLOCK m_srwStatus;
 
     static CService *s_pFirstService;

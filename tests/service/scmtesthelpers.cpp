@@ -192,6 +192,12 @@ bool SetImagePath(const wchar_t *wszService, const std::wstring &wstrImagePath)
                                 nullptr, nullptr, nullptr);
 }
 
+bool Delete(const wchar_t *wszService)
+{
+    CScHolder service(OpenService(wszService, DELETE));
+    return service.Get() != nullptr && DeleteService(service.Get());
+}
+
 void StopAndDelete(const wchar_t *wszService)
 {
     CScHolder service(OpenService(wszService, SERVICE_STOP | SERVICE_QUERY_STATUS | DELETE));
@@ -205,6 +211,40 @@ void StopAndDelete(const wchar_t *wszService)
         WaitForState(wszService, SERVICE_STOPPED, c_dwStopTimeoutMs);
     }
     DeleteService(service.Get());
+}
+
+CServiceProcess::CServiceProcess(DWORD dwProcessId)
+    : m_hProcess(OpenProcess(SYNCHRONIZE | PROCESS_QUERY_LIMITED_INFORMATION, FALSE, dwProcessId))
+{
+}
+
+CServiceProcess::~CServiceProcess()
+{
+    if (m_hProcess != nullptr)
+    {
+        CloseHandle(m_hProcess);
+    }
+}
+
+std::wstring CServiceProcess::ImageName() const
+{
+    wchar_t wszImage[MAX_PATH] = L"";
+    DWORD cchImage = MAX_PATH;
+    if (m_hProcess == nullptr || !QueryFullProcessImageNameW(m_hProcess, 0, wszImage, &cchImage))
+    {
+        return std::wstring();
+    }
+    return wszImage;
+}
+
+DWORD CServiceProcess::WaitForExitCode(DWORD dwTimeoutMs) const
+{
+    DWORD dwExitCode = STILL_ACTIVE;
+    if (m_hProcess != nullptr && WaitForSingleObject(m_hProcess, dwTimeoutMs) == WAIT_OBJECT_0)
+    {
+        GetExitCodeProcess(m_hProcess, &dwExitCode);
+    }
+    return dwExitCode;
 }
 
 bool ReadDword(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdw)

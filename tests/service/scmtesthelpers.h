@@ -37,6 +37,8 @@ bool ReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord);
 // Creates an own-process service running wstrImagePath; false when CreateService failed.
 bool CreateOwnProcess(const wchar_t *wszService, const std::wstring &wstrImagePath);
 bool SetImagePath(const wchar_t *wszService, const std::wstring &wstrImagePath);
+// Marks the service for deletion, leaving it as it runs; false when that failed.
+bool Delete(const wchar_t *wszService);
 // Stops (bounded) and deletes the service if it exists.
 void StopAndDelete(const wchar_t *wszService);
 
@@ -54,6 +56,24 @@ public:
 
 private:
     std::wstring m_wstrService;
+};
+
+// The process that runs a service, held open so that the test can see it leave.
+class CServiceProcess
+{
+public:
+    explicit CServiceProcess(DWORD dwProcessId);
+    ~CServiceProcess();
+    CServiceProcess(const CServiceProcess &) = delete;
+    CServiceProcess &operator=(const CServiceProcess &) = delete;
+
+    bool Opened() const { return m_hProcess != nullptr; }
+    std::wstring ImageName() const;
+    // Waits (bounded) for the process to end: its exit code, or STILL_ACTIVE when it did not.
+    DWORD WaitForExitCode(DWORD dwTimeoutMs) const;
+
+private:
+    HANDLE m_hProcess;
 };
 
 // A REG_DWORD or string value under HKEY_LOCAL_MACHINE, read without the helpers under test.

@@ -91,6 +91,22 @@ public:
     ~CInstallService() override { scmtest::StopAndDelete(ServiceName()); }
 };
 
+// Removes a test group's value from the host group key when the test ends, however it ends.
+class CGroupCleanup
+{
+public:
+    explicit CGroupCleanup(const std::wstring &wstrGroup)
+        : m_wstrGroup(wstrGroup)
+    {
+    }
+    ~CGroupCleanup() { RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str()); }
+    CGroupCleanup(const CGroupCleanup &) = delete;
+    CGroupCleanup &operator=(const CGroupCleanup &) = delete;
+
+private:
+    std::wstring m_wstrGroup;
+};
+
 class ServiceInstall : public ::testing::Test
 {
 protected:
@@ -197,6 +213,7 @@ TEST_F(ServiceInstall, HostDllValuesAndGroupList)
 {
     FailureCapture failures;
     std::wstring wstrGroup = scmtest::UniqueName(L"TelvaneTestGroup");
+    CGroupCleanup groupCleanup(wstrGroup);
     CTestService::SetHostMode(true, wstrGroup.c_str(), nullptr);
     // Someone else's service in the group stays where it is.
     RegHelperSetMultiString(c_wszSvchostGroupKey, wstrGroup.c_str(), {L"Other"});

@@ -72,13 +72,9 @@ protected:
         EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), status.dwServiceType);
         EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP), status.dwControlsAccepted);
 
-        HANDLE hHost =
-            OpenProcess(SYNCHRONIZE | PROCESS_QUERY_LIMITED_INFORMATION, FALSE, status.dwProcessId);
-        ASSERT_NE(nullptr, hHost);
-        wchar_t wszImage[MAX_PATH] = L"";
-        DWORD cchImage = MAX_PATH;
-        QueryFullProcessImageNameW(hHost, 0, wszImage, &cchImage);
-        std::wstring wstrImage(wszImage);
+        scmtest::CServiceProcess host(status.dwProcessId);
+        ASSERT_TRUE(host.Opened());
+        std::wstring wstrImage = host.ImageName();
         EXPECT_NE(std::wstring::npos, wstrImage.find(wszHostImage))
             << testsupport::Narrow(wstrImage);
 
@@ -87,11 +83,7 @@ protected:
         EXPECT_EQ(0u, status.dwWin32ExitCode);
 
         // The host leaves once its only service has stopped.
-        EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), WaitForSingleObject(hHost, c_dwStateWaitMs));
-        DWORD dwExitCode = 1;
-        GetExitCodeProcess(hHost, &dwExitCode);
-        EXPECT_EQ(0u, dwExitCode);
-        CloseHandle(hHost);
+        EXPECT_EQ(0u, host.WaitForExitCode(c_dwStateWaitMs));
     }
 };
 } // namespace

@@ -204,6 +204,7 @@ TEST_F(ServiceShell, SetStatusCheckPointsAndNothingAfterStopped)
 TEST_F(ServiceShell, ControlHandlerDispatchesAndReportsAgain)
 {
     CRecordingService service(L"Controlled");
+    service.m_fAcceptControl = true;
     CService::RegisterService(&service);
     service.m_hServiceStatus = c_hFakeStatus;
     service.SetStatus(SERVICE_RUNNING);
@@ -239,6 +240,15 @@ TEST_F(ServiceShell, ControlHandlerDispatchesAndReportsAgain)
         EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), Reports().back().dwState);
     }
     EXPECT_EQ(&iData, service.m_pvLastData);
+
+    // A user-defined control reaches only a service that takes them, but is answered all the
+    // same: any client with the right can send one.
+    service.m_fAcceptControl = false;
+    service.m_wstrLast.clear();
+    size_t cReports = Reports().size();
+    CService::ServiceControlHandler(200, 0, &iData, &service);
+    EXPECT_EQ(L"", service.m_wstrLast);
+    EXPECT_EQ(cReports + 1, Reports().size());
     EXPECT_EQ(0, service.m_cStops);
 }
 
@@ -247,6 +257,11 @@ TEST_F(ServiceShell, DefaultHandlersAssert)
     FailureCapture failures;
     CTestService service(L"Plain");
     CService::RegisterService(&service);
+    // Nobody asked for user-defined controls: one that arrives anyway is no fault.
+    CService::ServiceControlHandler(200, 0, nullptr, &service);
+    EXPECT_EQ(0u, failures.Count());
+
+    service.m_fAcceptControl = true;
     DWORD rgControls[] = {SERVICE_CONTROL_PAUSE,      SERVICE_CONTROL_CONTINUE,
                           SERVICE_CONTROL_SHUTDOWN,   SERVICE_CONTROL_DEVICEEVENT,
                           SERVICE_CONTROL_POWEREVENT, 200};
@@ -302,6 +317,46 @@ DWORD RunAsHosted(CTestService &service, SVCHOST_GLOBAL_DATA &globals)
 }
 } // namespace
 
+namespace
+{
+// A manual-reset event closed when the test ends.
+class CManualEvent
+{
+public:
+    CManualEvent()
+        : m_hEvent(CreateEventW(nullptr, TRUE, FALSE, nullptr))
+    {
+    }
+    ~CManualEvent() { CloseHandle(m_hEvent); }
+    CManualEvent(const CManualEvent &) = delete;
+    CManualEvent &operator=(const CManualEvent &) = delete;
+    HANDLE Get() const { return m_hEvent; }
+
+private:
+    HANDLE m_hEvent;
+};
+
+// Lets a held stop callback finish and waits for it when the test ends, however it ends.
+class CCallbacksDone
+{
+public:
+    explicit CCallbacksDone(HANDLE hRelease)
+        : m_hRelease(hRelease)
+    {
+    }
+    ~CCallbacksDone()
+    {
+        SetEvent(m_hRelease);
+        HostWaitForStopCallbacks(c_dwWaitMs);
+    }
+    CCallbacksDone(const CCallbacksDone &) = delete;
+    CCallbacksDone &operator=(const CCallbacksDone &) = delete;
+
+private:
+    HANDLE m_hRelease;
+};
+} // namespace
+
 // The stop event and the host's stop callback, then STOP through the handler.
 TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
 {
@@ -337,6 +392,55 @@ TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
     EXPECT_EQ(0u, failures.Count());
     CloseHandle(service.m_hStopEntered);
     CloseHandle(service.m_hStopRelease);
+}
+
+// A host that serves other services too keeps its process after STOPPED and may start the
+// service again at once, on another thread, while the stop callback of the first run is still
+// finishing. That callback must drop only its own wait and event, not the new run's.
+TEST_F(ServiceShell, StopCallbackLeavesTheNextStartAlone)
+{
+    FailureCapture failures;
+    SVCHOST_GLOBAL_DATA globals = {};
+    CTestService service(L"Restarted");
+    // Declared after the service: however the test ends, no callback outlives it.
+    CManualEvent stoppedReported;
+    CManualEvent stopFinish;
+    CManualEvent startDone;
+    CCallbacksDone callbacksDone(stopFinish.Get());
+    service.m_hStoppedReported = stoppedReported.Get();
+    service.m_hStopFinish = stopFinish.Get();
+    service.m_hStartDone = startDone.Get();
+    ASSERT_EQ(0u, RunAsHosted(service, globals));
+
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(stoppedReported.Get(), c_dwWaitMs));
+
+    // The next start, through ServiceMain itself (outside a service process the control
+    // handler cannot be registered: that fatal error is expected here).
+    wchar_t wszName[] = L"Restarted";
+    LPWSTR rgArgv[] = {wszName};
+    service.ServiceMain(1, rgArgv);
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(startDone.Get(), c_dwWaitMs));
+    HANDLE hNewStopEvent = service.m_hStopEvent;
+    HANDLE hNewStopWait = service.m_hStopWait;
+    ASSERT_NE(nullptr, hNewStopEvent);
+
+    // The first run's callback finishes after the new start.
+    SetEvent(stopFinish.Get());
+    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
+    EXPECT_EQ(hNewStopEvent, service.m_hStopEvent);
+    EXPECT_EQ(hNewStopWait, service.m_hStopWait);
+
+    // And the new run stops through its own event and callback.
+    ResetEvent(stoppedReported.Get());
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(stoppedReported.Get(), c_dwWaitMs));
+    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
+    EXPECT_EQ(2, service.m_cStops);
+    EXPECT_EQ(nullptr, service.m_hStopEvent);
+    EXPECT_EQ(nullptr, service.m_hStopWait);
+    EXPECT_EQ(1u, failures.Count());
+    EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
 }
 
 namespace
@@ -506,13 +610,14 @@ TEST_F(ServiceShell, ServiceMainPreparesTheStatusFromTheFlags)
     service.m_fAcceptControl = true;
     CService::RegisterService(&service);
 
+    HANDLE hStartDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    service.m_hStartDone = hStartDone;
     wchar_t wszName[] = L"Flags";
     LPWSTR rgArgv[] = {wszName};
     service.ServiceMain(1, rgArgv);
-    for (int i = 0; i < 1000 && service.m_status.dwCurrentState != SERVICE_RUNNING; i++)
-    {
-        Sleep(10);
-    }
+    DWORD dwWait = WaitForSingleObject(hStartDone, c_dwWaitMs);
+    CloseHandle(hStartDone);
+    ASSERT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
     ASSERT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
     EXPECT_EQ(1, service.m_cStarts);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), service.m_status.dwServiceType);

@@ -8,9 +8,39 @@
 
 #include <gtest/gtest.h>
 
+#include <thread>
+
+using testsupport::FailureCapture;
+
 namespace
 {
 const DWORD c_dwStateWaitMs = 30000;
+
+// The release event of a "hold-stop" service (see childservice.h), signalled and closed however the
+// test ends so that the service can stop before the test removes it.
+class CReleaseOnExit
+{
+public:
+    explicit CReleaseOnExit(const wchar_t *wszService)
+        : m_hEvent(CreateEventW(nullptr, TRUE, FALSE,
+                                (std::wstring(L"Global\\") + wszService + L"_release").c_str()))
+    {
+    }
+    ~CReleaseOnExit()
+    {
+        if (m_hEvent != nullptr)
+        {
+            SetEvent(m_hEvent);
+            CloseHandle(m_hEvent);
+        }
+    }
+    CReleaseOnExit(const CReleaseOnExit &) = delete;
+    CReleaseOnExit &operator=(const CReleaseOnExit &) = delete;
+    HANDLE Get() const { return m_hEvent; }
+
+private:
+    HANDLE m_hEvent;
+};
 
 std::wstring Quoted(const std::wstring &wstrPath)
 {
@@ -30,6 +60,27 @@ public:
     }
     const wchar_t *Name() const { return m_wstrName.c_str(); }
     bool Created() const { return m_fCreated; }
+
+    // Starts the service under host globals with OnStop held until the release event, and
+    // sends STOP; the status the control returned goes to *pStatus.
+    ::testing::AssertionResult StartAndHoldStop(SERVICE_STATUS *pStatus)
+    {
+        DWORD dwError = scmtest::StartWithArgs(Name(), {L"host", L"hold-stop"});
+        if (dwError != ERROR_SUCCESS)
+        {
+            return ::testing::AssertionFailure() << "StartService: " << dwError;
+        }
+        if (!scmtest::WaitForState(Name(), SERVICE_RUNNING, c_dwStateWaitMs))
+        {
+            return ::testing::AssertionFailure() << "never RUNNING";
+        }
+        dwError = scmtest::Control(Name(), SERVICE_CONTROL_STOP, pStatus);
+        if (dwError != ERROR_SUCCESS)
+        {
+            return ::testing::AssertionFailure() << "STOP: " << dwError;
+        }
+        return ::testing::AssertionSuccess();
+    }
 
 private:
     std::wstring m_wstrName;
@@ -73,29 +124,86 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
     }
 }
 
+// Any client with user-control access (on Windows, interactive users by default) can send
+// a control of 128 to 255 to any service, whether it asked for them or not. One it never
+// asked for must leave it running: here the default OnControl would end the process.
+TEST(ServiceMainUnderScm, UserControlNobodyAskedForLeavesTheServiceRunning)
+{
+    CChildServiceHolder child;
+    ASSERT_TRUE(child.Created());
+    ASSERT_EQ(0u, scmtest::StartWithArgs(child.Name(), {}));
+    SERVICE_STATUS_PROCESS status = {};
+    ASSERT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
+    scmtest::CServiceProcess process(status.dwProcessId);
+    ASSERT_TRUE(process.Opened());
+
+    SERVICE_STATUS statusControl = {};
+    EXPECT_EQ(0u, scmtest::Control(child.Name(), 200, &statusControl));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
+
+    // Still alive: it stops as usual, with no breakpoint seen, and its process leaves cleanly.
+    if (scmtest::Control(child.Name(), SERVICE_CONTROL_STOP, nullptr) == ERROR_SUCCESS)
+    {
+        EXPECT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
+        EXPECT_EQ(0u, status.dwServiceSpecificExitCode);
+    }
+    DWORD dwExitCode = process.WaitForExitCode(c_dwStateWaitMs);
+    EXPECT_EQ(0u, dwExitCode) << std::hex << dwExitCode;
+}
+
 TEST(ServiceMainUnderScm, StopUnderHostReturnsAtOnceAndStopsWhenOnStopEnds)
 {
     CChildServiceHolder child;
     ASSERT_TRUE(child.Created());
-    std::wstring wstrRelease = std::wstring(L"Global\\") + child.Name() + L"_release";
-    HANDLE hRelease = CreateEventW(nullptr, TRUE, FALSE, wstrRelease.c_str());
-    ASSERT_NE(nullptr, hRelease);
-
-    ASSERT_EQ(0u, scmtest::StartWithArgs(child.Name(), {L"host", L"hold-stop"}));
-    ASSERT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_RUNNING, c_dwStateWaitMs));
+    CReleaseOnExit release(child.Name());
+    ASSERT_NE(nullptr, release.Get());
 
     // The handler only signals the stop event: the control returns with RUNNING, and the
     // service stays RUNNING while OnStop works on the host's stop-callback thread.
     SERVICE_STATUS status = {};
-    EXPECT_EQ(0u, scmtest::Control(child.Name(), SERVICE_CONTROL_STOP, &status));
+    ASSERT_TRUE(child.StartAndHoldStop(&status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
     SERVICE_STATUS_PROCESS statusNow = {};
     ASSERT_TRUE(scmtest::QueryStatus(child.Name(), &statusNow));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusNow.dwCurrentState);
 
-    SetEvent(hRelease);
+    SetEvent(release.Get());
     EXPECT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
-    CloseHandle(hRelease);
+}
+
+// Someone deleted the service while it was stopping (sc stop, sc delete): the record stays,
+// marked for deletion, until the service is down. Unregistering it then is no error: the
+// stopping service cannot take another STOP (1061) and is already marked (1072).
+TEST(ServiceMainUnderScm, UnregisterOfAStoppingServiceMarkedForDeletion)
+{
+    FailureCapture failures;
+    CChildServiceHolder child;
+    ASSERT_TRUE(child.Created());
+    CReleaseOnExit release(child.Name());
+    ASSERT_NE(nullptr, release.Get());
+
+    // Stopping (OnStop holds until released), then deleted.
+    ASSERT_TRUE(child.StartAndHoldStop(nullptr));
+    ASSERT_TRUE(scmtest::Delete(child.Name()));
+
+    CTestService service(child.Name());
+    CService::RegisterService(&service);
+    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    std::thread unregister([&] {
+        service.UnregisterOneService();
+        SetEvent(hDone);
+    });
+    // Where the record lasts until the service is down (Windows), unregistering waits for
+    // it: let the service go after a while. Wine drops the record at once.
+    WaitForSingleObject(hDone, 1000);
+    SetEvent(release.Get());
+    DWORD dwWait = WaitForSingleObject(hDone, c_dwStateWaitMs);
+    unregister.join();
+    CloseHandle(hDone);
+    EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
+    EXPECT_EQ(0u, failures.Count());
+    EXPECT_FALSE(scmtest::ServiceExists(child.Name()));
+    EXPECT_EQ(1, service.m_cUnregisters);
 }
 
 namespace
@@ -112,6 +220,11 @@ public:
         m_fCreated = scmtest::CreateOwnProcess(m_wstrName.c_str(),
                                                Quoted(testsupport::BinDir() + L"telvanehost.exe") +
                                                    L" -k " + m_wstrGroup);
+        // Without the service, its key would stay behind with these values.
+        if (!m_fCreated)
+        {
+            return;
+        }
         std::wstring wstrParameters =
             L"SYSTEM\\CurrentControlSet\\Services\\" + m_wstrName + L"\\Parameters";
         RegHelperSetString(wstrParameters.c_str(), L"ServiceDll", testsupport::BinDir() + wszDll,
@@ -136,16 +249,14 @@ TEST(TelvaneHost, StopGoesThroughTheHostStopCallback)
 {
     CHostedServiceHolder hosted(L"servicetest.dll");
     ASSERT_TRUE(hosted.Created());
-    std::wstring wstrRelease = std::wstring(L"Global\\") + hosted.Name() + L"_release";
-    HANDLE hRelease = CreateEventW(nullptr, TRUE, FALSE, wstrRelease.c_str());
-    ASSERT_NE(nullptr, hRelease);
+    CReleaseOnExit release(hosted.Name());
+    ASSERT_NE(nullptr, release.Get());
 
     ASSERT_EQ(0u, scmtest::StartWithArgs(hosted.Name(), {L"hold-stop"}));
     SERVICE_STATUS_PROCESS status = {};
     ASSERT_TRUE(scmtest::WaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
-    HANDLE hHost =
-        OpenProcess(SYNCHRONIZE | PROCESS_QUERY_LIMITED_INFORMATION, FALSE, status.dwProcessId);
-    ASSERT_NE(nullptr, hHost);
+    scmtest::CServiceProcess host(status.dwProcessId);
+    ASSERT_TRUE(host.Opened());
 
     SERVICE_STATUS statusControl = {};
     EXPECT_EQ(0u, scmtest::Control(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
@@ -153,14 +264,9 @@ TEST(TelvaneHost, StopGoesThroughTheHostStopCallback)
     ASSERT_TRUE(scmtest::QueryStatus(hosted.Name(), &status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
 
-    SetEvent(hRelease);
+    SetEvent(release.Get());
     EXPECT_TRUE(scmtest::WaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
-    EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), WaitForSingleObject(hHost, c_dwStateWaitMs));
-    DWORD dwExitCode = 1;
-    GetExitCodeProcess(hHost, &dwExitCode);
-    EXPECT_EQ(0u, dwExitCode);
-    CloseHandle(hHost);
-    CloseHandle(hRelease);
+    EXPECT_EQ(0u, host.WaitForExitCode(c_dwStateWaitMs));
 }
 
 // A stopped service is deleted only once its host has left; registering the name again

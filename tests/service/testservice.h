@@ -36,6 +36,11 @@ public:
             SetStatus(SERVICE_RUNNING);
             SetStatus(SERVICE_STOPPED);
         }
+        // A start on the thread pool must be over before the test's service goes away.
+        if (m_hStartDone != nullptr)
+        {
+            SetEvent(m_hStartDone);
+        }
     }
 
     void OnStop() override
@@ -51,6 +56,16 @@ public:
         }
         InterlockedIncrement(&m_cStops);
         SetStatus(SERVICE_STOPPED);
+        // The window between STOPPED and the end of OnStop, in which the host may already
+        // start the service again.
+        if (m_hStoppedReported != nullptr)
+        {
+            SetEvent(m_hStoppedReported);
+        }
+        if (m_hStopFinish != nullptr)
+        {
+            WaitForSingleObject(m_hStopFinish, 10000);
+        }
     }
 
     void OnRegister() override { InterlockedIncrement(&m_cRegisters); }
@@ -92,6 +107,9 @@ public:
     volatile DWORD m_dwStopThread = 0;
     HANDLE m_hStopEntered = nullptr;
     HANDLE m_hStopRelease = nullptr;
+    HANDLE m_hStartDone = nullptr;
+    HANDLE m_hStoppedReported = nullptr;
+    HANDLE m_hStopFinish = nullptr;
 
 private:
     std::wstring m_wstrName;
