@@ -39,44 +39,38 @@ void DiagnosticsFailFast()
 }
 } // namespace
 
-HRESULT StringCchVPrintf(wchar_t *wszDest, size_t cchDest, const wchar_t *wszFormat, va_list args)
+// The string-safe contract on top of the Microsoft CRT's counted formatter, which leaves the
+// buffer unterminated when the text fills it exactly or is cut.
+template <class TChar, class TFormatter>
+HRESULT StringCchVPrintfT(TChar *pszDest, size_t cchDest, const TChar *pszFormat, va_list args,
+                          TFormatter pfnFormat)
 {
     if (cchDest == 0 || cchDest > c_cchMax)
     {
         if (cchDest != 0)
         {
-            wszDest[0] = L'\0';
+            pszDest[0] = TChar(0);
         }
         return E_INVALIDARG;
     }
-    int cch = _vsnwprintf(wszDest, cchDest - 1, wszFormat, args);
+    int cch = pfnFormat(pszDest, cchDest - 1, pszFormat, args);
     if (cch < 0 || static_cast<size_t>(cch) > cchDest - 1)
     {
-        wszDest[cchDest - 1] = L'\0';
+        pszDest[cchDest - 1] = TChar(0);
         return c_hrInsufficientBuffer;
     }
-    wszDest[cch] = L'\0';
+    pszDest[cch] = TChar(0);
     return S_OK;
+}
+
+HRESULT StringCchVPrintf(wchar_t *wszDest, size_t cchDest, const wchar_t *wszFormat, va_list args)
+{
+    return StringCchVPrintfT(wszDest, cchDest, wszFormat, args, _vsnwprintf);
 }
 
 HRESULT StringCchVPrintf(char *szDest, size_t cchDest, const char *szFormat, va_list args)
 {
-    if (cchDest == 0 || cchDest > c_cchMax)
-    {
-        if (cchDest != 0)
-        {
-            szDest[0] = '\0';
-        }
-        return E_INVALIDARG;
-    }
-    int cch = _vsnprintf(szDest, cchDest - 1, szFormat, args);
-    if (cch < 0 || static_cast<size_t>(cch) > cchDest - 1)
-    {
-        szDest[cchDest - 1] = '\0';
-        return c_hrInsufficientBuffer;
-    }
-    szDest[cch] = '\0';
-    return S_OK;
+    return StringCchVPrintfT(szDest, cchDest, szFormat, args, _vsnprintf);
 }
 
 HRESULT StringCchPrintf(wchar_t *wszDest, size_t cchDest, const wchar_t *wszFormat, ...)
