@@ -163,7 +163,10 @@ void TraceWideMessage(REGHANDLE hProvider, const wchar_t *wszText)
 
 void TelvaneTraceRegister()
 {
+    // An empty value is read as length 0 without touching the last error, so clear it first
+    // or an error left by earlier code would hide the variable.
     wchar_t wszValue[8];
+    SetLastError(ERROR_SUCCESS);
     if (GetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", wszValue, ARRAYSIZE(wszValue)) != 0 ||
         GetLastError() != ERROR_ENVVAR_NOT_FOUND)
     {

@@ -2,6 +2,7 @@
 #include "servicelib/diagnostics.h"
 
 #include <mutex>
+#include <wchar.h>
 
 namespace testsupport
 {
@@ -21,6 +22,27 @@ void OnLog(const wchar_t *wszLine)
 {
     std::lock_guard<std::mutex> guard(s_lock);
     s_rgLog.push_back(wszLine);
+}
+
+// The name of an environment entry ends at the first '=' after its first character (names
+// of the hidden per-drive entries start with one).
+std::wstring EnvironmentName(const wchar_t *wszEntry)
+{
+    const wchar_t *pEquals = wszEntry[0] != L'\0' ? wcschr(wszEntry + 1, L'=') : nullptr;
+    return pEquals != nullptr ? std::wstring(wszEntry, pEquals) : std::wstring(wszEntry);
+}
+
+bool EnvironmentNamesEntry(const std::vector<std::wstring> &rgEnvironment, const wchar_t *wszEntry)
+{
+    std::wstring name = EnvironmentName(wszEntry);
+    for (const std::wstring &entry : rgEnvironment)
+    {
+        if (_wcsicmp(EnvironmentName(entry.c_str()).c_str(), name.c_str()) == 0)
+        {
+            return true;
+        }
+    }
+    return false;
 }
 
 bool AnyContains(const std::vector<std::wstring> &rg, const std::wstring &text)
@@ -104,13 +126,17 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
     }
     SetHandleInformation(hRead, HANDLE_FLAG_INHERIT, 0);
 
-    // Environment block: ours plus the extra entries.
+    // Environment block: ours plus the extra entries. A child reads the first entry of a
+    // name, so an inherited entry that an extra one names again is left out.
     std::wstring block;
     LPWCH pEnv = GetEnvironmentStringsW();
     for (LPWCH p = pEnv; *p != L'\0'; p += wcslen(p) + 1)
     {
-        block.append(p);
-        block.push_back(L'\0');
+        if (!EnvironmentNamesEntry(rgEnvironment, p))
+        {
+            block.append(p);
+            block.push_back(L'\0');
+        }
     }
     FreeEnvironmentStringsW(pEnv);
     for (const std::wstring &entry : rgEnvironment)
@@ -147,6 +173,16 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
         DWORD cbAvail = 0;
         if (!PeekNamedPipe(hRead, nullptr, 0, nullptr, &cbAvail, nullptr))
         {
+            // The output is closed, but the process may still be running: its exit code is
+            // only known once it has ended.
+            ULONGLONG ullNow = GetTickCount64();
+            DWORD dwLeft = ullNow < ullDeadline ? static_cast<DWORD>(ullDeadline - ullNow) : 0;
+            if (WaitForSingleObject(pi.hProcess, dwLeft) != WAIT_OBJECT_0)
+            {
+                result.fTimedOut = true;
+                TerminateProcess(pi.hProcess, 1);
+                WaitForSingleObject(pi.hProcess, 5000);
+            }
             break;
         }
         if (cbAvail > 0)

@@ -36,8 +36,9 @@ struct ChildResult
     bool fTimedOut = false;
 };
 
-// Runs a program with the given command line, extra environment entries ("NAME=value")
-// and a time limit, and collects what it prints.
+// Runs a program with the given command line, extra environment entries ("NAME=value",
+// each replacing an inherited variable of that name) and a time limit, and collects what
+// it prints.
 ChildResult RunChild(const std::wstring &wstrCommandLine,
                      const std::vector<std::wstring> &rgEnvironment = {},
                      DWORD dwTimeoutMs = 60000);

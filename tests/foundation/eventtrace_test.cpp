@@ -78,6 +78,8 @@ TEST_F(EventTraceTest, EnableCallbackSetsBitsByLevelAndKeyword)
 
     Session(EVENT_CONTROL_CODE_ENABLE_PROVIDER, 3, 0x100, 0); // failures need level 4
     EXPECT_EQ(Bits3({true, false, false}), Bits());
+    Session(EVENT_CONTROL_CODE_ENABLE_PROVIDER, 4, 0x100, 0);
+    EXPECT_EQ(Bits3({true, true, false}), Bits());
 
     Session(EVENT_CONTROL_CODE_ENABLE_PROVIDER, 5, 0x500, 0);
     EXPECT_EQ(Bits3({true, true, true}), Bits());
@@ -162,11 +164,16 @@ TEST(EventTraceRegistration, RegistersOnceAndUnregistersOnce)
     context.hRegistration = 0;
     const GUID guid = {
         0x4637124C, 0x1D40, 0x4B4D, {0x89, 0x2F, 0x2A, 0xAE, 0xCF, 0x24, 0xFF, 0x06}};
+    // A handle that is already there is kept (Wine hands out one constant handle, so only
+    // a value of our own shows whether registration ran again).
+    const REGHANDLE hExisting = 0x5E7;
+    context.hRegistration = hExisting;
     TraceProviderRegister(guid, &context);
-    REGHANDLE hFirst = context.hRegistration;
-    EXPECT_NE(0u, hFirst);
+    EXPECT_EQ(hExisting, context.hRegistration);
+
+    context.hRegistration = 0;
     TraceProviderRegister(guid, &context);
-    EXPECT_EQ(hFirst, context.hRegistration);
+    EXPECT_NE(0u, context.hRegistration);
     TraceProviderUnregister(&context);
     EXPECT_EQ(0u, context.hRegistration);
     TraceProviderUnregister(&context);
@@ -176,6 +183,8 @@ TEST(EventTraceRegistration, RegistersOnceAndUnregistersOnce)
 TEST(EventTraceEcho, EnvironmentVariableEchoesEveryEvent)
 {
     const std::wstring child = L"\"" + testsupport::BinDir() + L"foundation_child.exe\" trace";
+    // The quiet run inherits this process's environment, which may come with the variable.
+    SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", nullptr);
     testsupport::ChildResult quiet = testsupport::RunChild(child);
     EXPECT_EQ(0u, quiet.dwExitCode);
     EXPECT_EQ(std::string::npos, quiet.strOutput.find("1001")) << quiet.strOutput;
@@ -193,4 +202,9 @@ TEST(EventTraceEcho, EnvironmentVariableEchoesEveryEvent)
     {
         EXPECT_NE(std::string::npos, echo.strOutput.find(sz)) << sz << "\n" << echo.strOutput;
     }
+
+    // Set but empty still counts as set, whatever error the thread saw before.
+    testsupport::ChildResult empty = testsupport::RunChild(child, {L"TELVANE_TRACE_STDOUT="});
+    EXPECT_EQ(0u, empty.dwExitCode);
+    EXPECT_NE(std::string::npos, empty.strOutput.find(rgszExpected[0])) << empty.strOutput;
 }

@@ -5,10 +5,56 @@
 
 #include <gtest/gtest.h>
 #include <atomic>
+#include <cstdlib>
+#include <new>
 #include <thread>
 #include <vector>
 
 using testsupport::FailureCapture;
+
+namespace
+{
+// Allocation goes straight to the C heap here, and one address at a time is watched for its
+// delete, so a test can see that an object it cannot otherwise reach (an object's
+// Synchronizer) was really freed.
+std::atomic<void *> s_pvWatched{nullptr};
+std::atomic<bool> s_fWatchedFreed{false};
+
+void WatchDelete(void *pv)
+{
+    s_fWatchedFreed = false;
+    s_pvWatched = pv;
+}
+
+void FreeWatched(void *pv)
+{
+    if (pv != nullptr && pv == s_pvWatched.load())
+    {
+        s_fWatchedFreed = true;
+    }
+    std::free(pv);
+}
+} // namespace
+
+void *operator new(std::size_t cb)
+{
+    void *pv = std::malloc(cb != 0 ? cb : 1);
+    if (pv == nullptr)
+    {
+        throw std::bad_alloc();
+    }
+    return pv;
+}
+
+void operator delete(void *pv) noexcept
+{
+    FreeWatched(pv);
+}
+
+void operator delete(void *pv, std::size_t) noexcept
+{
+    FreeWatched(pv);
+}
 
 namespace
 {
@@ -41,6 +87,8 @@ public:
         Post(ulType, a1, a2, a3);
     }
 
+    void *SynchronizerAddress() const { return m_pSynchronizer; }
+
     void Dispatch(ULONG ulEventType, ULONG_PTR ulArg1, ULONG_PTR ulArg2, ULONG_PTR ulArg3) override
     {
         if (m_fInside.exchange(true))
@@ -65,10 +113,13 @@ public:
             }
             m_fPostedThree = true;
             break;
-        case EventPostToOther:
+        case EventPostToOther: {
             m_rgRecords.push_back({0, 0, GetCurrentThreadId(), m_cDepth});
-            reinterpret_cast<CRecorder *>(ulArg1)->Send(EventRecord, 9, 9);
+            CRecorder *pOther = reinterpret_cast<CRecorder *>(ulArg1);
+            pOther->Send(EventRecord, 9, 9);
+            m_cOtherRecordsAfterPost = pOther->m_rgRecords.size();
             break;
+        }
         case EventDropCreator:
             Release();
             break;
@@ -105,6 +156,7 @@ public:
     std::atomic<int> m_cOverlaps{0};
     int m_cDepth = 0;
     bool m_fPostedThree = false;
+    size_t m_cOtherRecordsAfterPost = 0;
 
 private:
     TaggedRefCount<1> m_refs;
@@ -170,6 +222,8 @@ TEST(Synchronizer, PostToAnotherIdleObjectRunsNested)
     CRecorder *pFirst = new CRecorder();
     CRecorder *pSecond = new CRecorder();
     pFirst->Send(EventPostToOther, reinterpret_cast<ULONG_PTR>(pSecond));
+    // The other object's handler had run by the time its Post returned inside ours.
+    EXPECT_EQ(1u, pFirst->m_cOtherRecordsAfterPost);
     ASSERT_EQ(1u, pSecond->m_rgRecords.size());
     EXPECT_EQ(GetCurrentThreadId(), pSecond->m_rgRecords[0].dwThread);
     EXPECT_EQ(9u, pSecond->m_rgRecords[0].ulSequence);
@@ -182,10 +236,21 @@ TEST(Synchronizer, ObjectDeletedByTheReleaseAfterItsLastEvent)
     FailureCapture failures;
     bool fDeleted = false;
     CRecorder *pObject = new CRecorder(&fDeleted);
+    WatchDelete(pObject->SynchronizerAddress());
     // The handler drops the creator's reference; the Post's own release then deletes the
     // object inside the dispatch loop, which must delete the Synchronizer after draining.
     pObject->Send(EventDropCreator);
     EXPECT_TRUE(fDeleted);
+    EXPECT_TRUE(s_fWatchedFreed.load()) << "Synchronizer left behind";
+    EXPECT_EQ(0u, failures.Count());
+
+    // An idle object's Synchronizer goes with the object at once.
+    pObject = new CRecorder();
+    pObject->Send(EventRecord);
+    WatchDelete(pObject->SynchronizerAddress());
+    pObject->Release();
+    EXPECT_TRUE(s_fWatchedFreed.load());
+    WatchDelete(nullptr);
     EXPECT_EQ(0u, failures.Count());
 }
 
