@@ -133,6 +133,12 @@ DWORD Control(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatu
     return dwError;
 }
 
+DWORD Stop(const wchar_t *wszService)
+{
+    DWORD dwError = Control(wszService, SERVICE_CONTROL_STOP, nullptr);
+    return dwError == ERROR_BROKEN_PIPE ? ERROR_SUCCESS : dwError;
+}
+
 bool ReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord)
 {
     CScHolder service(OpenService(wszService, SERVICE_QUERY_CONFIG));
@@ -205,8 +211,7 @@ void StopAndDelete(const wchar_t *wszService)
     {
         return;
     }
-    SERVICE_STATUS status = {};
-    if (ControlService(service.Get(), SERVICE_CONTROL_STOP, &status))
+    if (Stop(wszService) == ERROR_SUCCESS)
     {
         WaitForState(wszService, SERVICE_STOPPED, c_dwStopTimeoutMs);
     }

@@ -21,6 +21,10 @@ bool ServiceExists(const wchar_t *wszService);
 DWORD StartWithArgs(const wchar_t *wszService, const std::vector<std::wstring> &rgArgs);
 // Sends a control; returns its error or 0 and fills *pStatus with what ControlService gave.
 DWORD Control(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatus);
+// Sends STOP. A service whose handler stops it at once lets its process exit right away, and
+// Wine's control manager, reading the handler's answer after that, reports 109 although the
+// control was delivered: that counts as sent. Callers check the STOPPED state themselves.
+DWORD Stop(const wchar_t *wszService);
 
 struct SERVICE_RECORD
 {

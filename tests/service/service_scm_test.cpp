@@ -78,7 +78,7 @@ protected:
         EXPECT_NE(std::wstring::npos, wstrImage.find(wszHostImage))
             << testsupport::Narrow(wstrImage);
 
-        EXPECT_EQ(0u, scmtest::Control(c_wszTelvane, SERVICE_CONTROL_STOP, nullptr));
+        EXPECT_EQ(0u, scmtest::Stop(c_wszTelvane));
         EXPECT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
         EXPECT_EQ(0u, status.dwWin32ExitCode);
 

@@ -116,7 +116,7 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
         EXPECT_EQ(testCase.dwWaitHint, status.dwWaitHint);
 
         // Without a host, STOP runs OnStop in the handler, even before RUNNING.
-        EXPECT_EQ(0u, scmtest::Control(child.Name(), SERVICE_CONTROL_STOP, nullptr));
+        EXPECT_EQ(0u, scmtest::Stop(child.Name()));
         ASSERT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
         // The child reports the breakpoints it saw after START_PENDING.
         EXPECT_EQ(static_cast<DWORD>(ERROR_SERVICE_SPECIFIC_ERROR), status.dwWin32ExitCode);
@@ -142,7 +142,7 @@ TEST(ServiceMainUnderScm, UserControlNobodyAskedForLeavesTheServiceRunning)
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
 
     // Still alive: it stops as usual, with no breakpoint seen, and its process leaves cleanly.
-    if (scmtest::Control(child.Name(), SERVICE_CONTROL_STOP, nullptr) == ERROR_SUCCESS)
+    if (scmtest::Stop(child.Name()) == ERROR_SUCCESS)
     {
         EXPECT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
         EXPECT_EQ(0u, status.dwServiceSpecificExitCode);
