@@ -239,8 +239,3 @@ void TraceSetWriteHook(PFN_TRACE_WRITE pfnHook)
 {
     s_pfnWriteHook = pfnHook;
 }
-
-void TraceSetEcho(bool fEcho)
-{
-    s_fEcho = fEcho;
-}

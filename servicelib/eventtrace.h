@@ -61,4 +61,3 @@ void TelvaneTraceCommandLine(const wchar_t *wszCommandLine);   // 2008
 typedef void (*PFN_TRACE_WRITE)(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor,
                                 ULONG cData, const EVENT_DATA_DESCRIPTOR *pData);
 void TraceSetWriteHook(PFN_TRACE_WRITE pfnHook);
-void TraceSetEcho(bool fEcho);

@@ -233,11 +233,6 @@ std::wstring BinDir()
     return path.substr(0, path.find_last_of(L"\\/") + 1);
 }
 
-std::wstring Widen(const std::string &str)
-{
-    return std::wstring(str.begin(), str.end());
-}
-
 std::string Narrow(const std::wstring &wstr)
 {
     std::string str;

@@ -46,6 +46,5 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
 // Directory of the running test executable, with a trailing backslash (build\bin\).
 std::wstring BinDir();
 
-std::wstring Widen(const std::string &str);
 std::string Narrow(const std::wstring &wstr);
 } // namespace testsupport
