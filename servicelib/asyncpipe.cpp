@@ -252,7 +252,7 @@ void AsyncPipe::Dispatch(ULONG ulEventType, ULONG_PTR ulArg1, ULONG_PTR ulArg2, 
         WriteCompletedCallback();
         break;
     default:
-        DISPATCH_UNKNOWN_EVENT(L"AsyncPipe", ulEventType);
+        DISPATCH_UNKNOWN_EVENT(L"AsyncPipe::Dispatch", L"AsyncPipe::EventType %u", ulEventType);
         break;
     }
 }

@@ -85,12 +85,8 @@ SynchronizedObject::~SynchronizedObject()
     m_pSynchronizer = nullptr;
 }
 
-void SynchronizedObject::FatalUnknownEvent(const wchar_t *wszClass, const wchar_t *wszFile,
-                                           ULONG ulLine, ULONG ulEventType)
+void SynchronizedObject::FatalUnknownEvent(const wchar_t *wszFunction, const wchar_t *wszName,
+                                           const wchar_t *wszFile, ULONG ulLine, ULONG ulEventType)
 {
-    wchar_t wszFunction[128];
-    wchar_t wszName[128];
-    StringCchPrintf(wszFunction, ARRAYSIZE(wszFunction), L"%s::Dispatch", wszClass);
-    StringCchPrintf(wszName, ARRAYSIZE(wszName), L"%s::EventType %u", wszClass, ulEventType);
     FatalError(wszFunction, wszFile, ulLine, wszName, ulEventType);
 }

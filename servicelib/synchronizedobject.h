@@ -66,13 +66,15 @@ protected:
         m_pSynchronizer->Post(this, ulEventType, ulArg1, ulArg2, ulArg3);
     }
 
-    // The fatal error of Dispatch for an event number the class does not know:
-    // reported from "<class>::Dispatch" as "<class>::EventType <n>" with the number as code.
-    static void FatalUnknownEvent(const wchar_t *wszClass, const wchar_t *wszFile, ULONG ulLine,
-                                  ULONG ulEventType);
+    // The fatal error of Dispatch for an event number the class does not know: reported from
+    // wszFunction ("<class>::Dispatch") with the name text as it stands ("<class>::EventType
+    // %u", unformatted) and the number as the code.
+    static void FatalUnknownEvent(const wchar_t *wszFunction, const wchar_t *wszName,
+                                  const wchar_t *wszFile, ULONG ulLine, ULONG ulEventType);
 
     Synchronizer *m_pSynchronizer;
 };
 
-#define DISPATCH_UNKNOWN_EVENT(wszClass, ulEventType)                                              \
-    FatalUnknownEvent((wszClass), TELVANE_WFILE, __LINE__, (ulEventType))
+// DISPATCH_UNKNOWN_EVENT(L"CServiceActivity::Dispatch", L"CClientActivity::EventType %u", n)
+#define DISPATCH_UNKNOWN_EVENT(wszFunction, wszName, ulEventType)                                  \
+    FatalUnknownEvent((wszFunction), (wszName), TELVANE_WFILE, __LINE__, (ulEventType))

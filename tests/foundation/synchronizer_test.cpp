@@ -126,7 +126,7 @@ public:
         default:
             m_cDepth--;
             m_fInside = false;
-            DISPATCH_UNKNOWN_EVENT(L"CRecorder", ulEventType);
+            DISPATCH_UNKNOWN_EVENT(L"CRecorder::Dispatch", L"CRecorder::EventType %u", ulEventType);
             return;
         }
         m_cDepth--;
@@ -261,7 +261,7 @@ TEST(Synchronizer, UnknownEventIsFatal)
     pObject->Send(77);
     ASSERT_EQ(1u, failures.Count());
     EXPECT_TRUE(
-        failures.Contains(L"CRecorder::Dispatch: Fatal error 0x4d from CRecorder::EventType 77"))
+        failures.Contains(L"CRecorder::Dispatch: Fatal error 0x4d from CRecorder::EventType %u"))
         << testsupport::Narrow(failures.Lines()[0]);
     pObject->Release();
 }

@@ -484,7 +484,7 @@ TEST(AsyncPipe, UnknownEventIsFatalErrorNamingThePipe)
     AsyncPipe *pPipe = new AsyncPipe();
     pPipe->Dispatch(77, 0, 0, 0);
     EXPECT_TRUE(failures.Contains(L"AsyncPipe::Dispatch: Fatal error 0x4d from "
-                                  L"AsyncPipe::EventType 77"));
+                                  L"AsyncPipe::EventType %u"));
     EXPECT_EQ(1u, failures.Count());
     pPipe->Release();
 }

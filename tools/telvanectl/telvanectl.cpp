@@ -2,6 +2,7 @@
 // scripts. Runs on its main thread only.
 #include "client/cactivityclient.h"
 #include "client/ccollectorclient.h"
+#include "tools/telvanectl/ctlcommand.h"
 
 #include <windows.h>
 #include <rpc.h>
@@ -45,6 +46,7 @@ struct CtlOptions
 int CtlUsage(const char *szProblem)
 {
     fprintf(stderr, "telvanectl: %s\n%s", szProblem, c_szUsage);
+    CtlCommand::PrintUsages();
     return c_iExitUsage;
 }
 
@@ -368,6 +370,16 @@ int wmain(int argc, wchar_t **argv)
         return CtlUsage("no command");
     }
     std::wstring command = argv[1];
+    if (command != L"activity" && command != L"collector")
+    {
+        int cWords = 0;
+        const CtlCommand *pCommand = CtlCommand::Find(argc - 1, argv + 1, &cWords);
+        if (pCommand == nullptr)
+        {
+            return CtlUsage("unknown command");
+        }
+        return pCommand->Run(argc - 1 - cWords, argv + 1 + cWords);
+    }
     CtlOptions options;
     const char *szProblem = nullptr;
     if (!CtlParseOptions(argc, argv, &options, &szProblem))
