@@ -148,13 +148,14 @@ int CtlState(int argc, wchar_t **argv)
 
 const CtlCommand s_commandBacklight(
     L"platform backlight", CtlBacklight,
-    "       telvanectl platform backlight [VALUE]   publish (or show) the display backlight\n"
-    "                                               state; 1 means no change of interest\n");
+    "telvanectl platform backlight [VALUE]\n"
+    "           publishes VALUE (a 32-bit number) as the display backlight state, or shows\n"
+    "           the state; 1 is the value the service ignores\n");
 const CtlCommand s_commandPower(
     L"platform power", CtlPowerSource,
-    "       telvanectl platform power [VALUE]       publish (or show) the power-source state;\n"
-    "                                               0 means mains power\n");
-const CtlCommand s_commandState(
-    L"platform state", CtlState,
-    "       telvanectl platform state NAME [VALUE]  the same for any state NAME (0x hex)\n");
+    "telvanectl platform power [VALUE]\n"
+    "           the same for the power-source state; 0 means mains power\n");
+const CtlCommand s_commandState(L"platform state", CtlState,
+                                "telvanectl platform state NAME [VALUE]\n"
+                                "           the same for any state NAME (a 64-bit number)\n");
 } // namespace
