@@ -6,6 +6,12 @@
 #define REG_NOTIFY_THREAD_AGNOSTIC 0x10000000L
 #endif
 
+namespace
+{
+// Any address inside this module names it to GetModuleHandleExW.
+const char s_chModuleAnchor = 0;
+} // namespace
+
 CWnfSubscription::CWnfSubscription(WNF_STATE_NAME stateName, WNF_CHANGE_STAMP stampSeen,
                                    PWNF_USER_CALLBACK pfnCallback, PVOID pvContext,
                                    PCWNF_TYPE_ID pTypeId)
@@ -33,10 +39,18 @@ CWnfSubscription::~CWnfSubscription()
     m_hChanged.Close();
     m_hKey.Close();
     DeleteCriticalSection(&m_cs);
+    // Only the owner's thread gets here with the module still held (the callback hands its
+    // reference to the pool first), and the owner's own code holds the module meanwhile.
+    m_hModule.Close();
 }
 
 NTSTATUS CWnfSubscription::Start()
 {
+    if (!GetModuleHandleExW(GET_MODULE_HANDLE_EX_FLAG_FROM_ADDRESS,
+                            reinterpret_cast<LPCWSTR>(&s_chModuleAnchor), m_hModule.Receive()))
+    {
+        return StateStoreStatusFromError(static_cast<LONG>(GetLastError()));
+    }
     // The subscriber creates the state's key when nobody has published yet: a key must exist
     // to be watched.
     LONG lError =
@@ -91,7 +105,7 @@ VOID CALLBACK CWnfSubscription::WaitCallback(PTP_CALLBACK_INSTANCE pInstance, PV
                                              PTP_WAIT pWait, TP_WAIT_RESULT waitResult)
 {
     CWnfSubscription *pThis = static_cast<CWnfSubscription *>(pvContext);
-    if (pThis->OnChanged())
+    if (pThis->OnChanged(pInstance))
     {
         delete pThis;
     }
@@ -106,7 +120,7 @@ LONG CWnfSubscription::WatchKey()
                                    m_hChanged.Get(), TRUE);
 }
 
-bool CWnfSubscription::OnChanged()
+bool CWnfSubscription::OnChanged(PTP_CALLBACK_INSTANCE pInstance)
 {
     EnterCriticalSection(&m_cs);
     bool fStopped = m_fStopped;
@@ -143,6 +157,8 @@ bool CWnfSubscription::OnChanged()
         LeaveCriticalSection(&m_cs);
         if (fFree)
         {
+            // The pool lets go of the module once this callback has returned out of it.
+            FreeLibraryWhenCallbackReturns(pInstance, m_hModule.Detach());
             return true;
         }
     }

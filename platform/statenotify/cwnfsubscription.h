@@ -30,7 +30,7 @@ private:
     static VOID CALLBACK WaitCallback(PTP_CALLBACK_INSTANCE pInstance, PVOID pvContext,
                                       PTP_WAIT pWait, TP_WAIT_RESULT waitResult);
     // Delivers what changed; returns true when the subscription must be freed now.
-    bool OnChanged();
+    bool OnChanged(PTP_CALLBACK_INSTANCE pInstance);
     LONG WatchKey();
 
     const WNF_STATE_NAME m_stateName;
@@ -45,6 +45,10 @@ private:
     bool m_fFreeWhenCallbackEnds; // stopped from inside its own callback
     DWORD m_dwCallbackThread;     // thread inside the subscriber's callback, or 0
 
+    // The module the callback code lives in (this one), pinned while the subscription lives:
+    // a subscriber may unload it as soon as its unsubscribe returns, even when that was
+    // inside the callback, which still has to return through this code.
+    CModuleHandle m_hModule;
     CRegKeyHandle m_hKey;
     CKernelHandle m_hChanged; // auto-reset; set by the registry on a change, and by Start
     CThreadpoolWaitHandle m_hWait;

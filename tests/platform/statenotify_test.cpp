@@ -375,3 +375,69 @@ TEST(StateNotify, UnsubscribeRacingTheFirstDeliveryIsSafe)
         EXPECT_LE(log.Count(), 1u);
     }
 }
+
+namespace
+{
+typedef NTSTATUS (*PFN_SUBSCRIBE_SELF_ENDING)(WNF_STATE_NAME, HANDLE, HANDLE);
+typedef NTSTATUS (*PFN_SUBSCRIBE_PLAIN)(WNF_STATE_NAME);
+typedef NTSTATUS (*PFN_UNSUBSCRIBE_PLAIN)();
+const wchar_t c_wszTestDll[] = L"statenotifytest.dll";
+
+template <class PFN>
+PFN TestDllExport(HMODULE hModule, const char *szName)
+{
+    return reinterpret_cast<PFN>(reinterpret_cast<void *>(GetProcAddress(hModule, szName)));
+}
+
+// The DLL goes once the last reference is gone; a thread of the pool may still be on its
+// way out of it, so this waits (a hang limit, not a measurement).
+bool TestDllUnloads()
+{
+    for (int i = 0; i < 3000 && GetModuleHandleW(c_wszTestDll) != nullptr; i++)
+    {
+        Sleep(10);
+    }
+    return GetModuleHandleW(c_wszTestDll) == nullptr;
+}
+} // namespace
+
+// The service DLL may be unloaded as soon as its stop is reported, and its launcher ends its
+// subscription from inside the subscription's callback: the code the callback returns into
+// must stay loaded until the callback has left it.
+TEST(StateNotify, ModuleOfACallbackThatUnsubscribedStaysUntilTheCallbackReturns)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    HANDLE hUnsubscribed = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    HANDLE hGo = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    HMODULE hDll = LoadLibraryW((testsupport::BinDir() + c_wszTestDll).c_str());
+    ASSERT_NE(nullptr, hDll);
+    auto pfnSubscribe = TestDllExport<PFN_SUBSCRIBE_SELF_ENDING>(hDll, "SubscribeSelfEnding");
+    ASSERT_NE(nullptr, pfnSubscribe);
+    ASSERT_EQ(STATUS_SUCCESS, pfnSubscribe(stateName, hUnsubscribed, hGo));
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(hUnsubscribed, 30000));
+
+    // The subscription has ended, as far as its owner knows, and the owner lets go.
+    FreeLibrary(hDll);
+    EXPECT_NE(nullptr, GetModuleHandleW(c_wszTestDll));
+    SetEvent(hGo);
+    EXPECT_TRUE(TestDllUnloads());
+    CloseHandle(hUnsubscribed);
+    CloseHandle(hGo);
+}
+
+TEST(StateNotify, EndedSubscriptionLeavesItsModuleFree)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    HMODULE hDll = LoadLibraryW((testsupport::BinDir() + c_wszTestDll).c_str());
+    ASSERT_NE(nullptr, hDll);
+    auto pfnSubscribe = TestDllExport<PFN_SUBSCRIBE_PLAIN>(hDll, "SubscribePlain");
+    auto pfnUnsubscribe = TestDllExport<PFN_UNSUBSCRIBE_PLAIN>(hDll, "UnsubscribePlain");
+    ASSERT_NE(nullptr, pfnSubscribe);
+    ASSERT_NE(nullptr, pfnUnsubscribe);
+    ASSERT_EQ(STATUS_SUCCESS, pfnSubscribe(stateName));
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+    EXPECT_EQ(STATUS_SUCCESS, pfnUnsubscribe());
+    FreeLibrary(hDll);
+    EXPECT_TRUE(TestDllUnloads());
+}
