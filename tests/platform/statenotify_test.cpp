@@ -441,3 +441,50 @@ TEST(StateNotify, EndedSubscriptionLeavesItsModuleFree)
     FreeLibrary(hDll);
     EXPECT_TRUE(TestDllUnloads());
 }
+
+// The store is an ordinary registry value that anybody with the rights can overwrite: what
+// no publisher writes is refused by the query, skipped by subscribers, and repaired by the
+// next publication.
+TEST(StateNotify, ValueNoPublisherWroteIsRefusedThenRepaired)
+{
+    struct Case
+    {
+        const char *szWhat;
+        DWORD dwType;
+        std::vector<BYTE> vbValue;
+    };
+    const Case rgCases[] = {
+        {"text", REG_SZ, {'x', 0, 0, 0}},
+        {"shorter than a stamp", REG_BINARY, {1, 0, 0}},
+        {"stamp 0", REG_BINARY, {0, 0, 0, 0, 9}},
+        {"more data than a state holds", REG_BINARY,
+         std::vector<BYTE>(sizeof(WNF_CHANGE_STAMP) + WNF_STATE_MAX_DATA_SIZE + 1, 1)},
+    };
+    for (const Case &c : rgCases)
+    {
+        WNF_STATE_NAME stateName = NewStateName();
+        CDeliveryLog log;
+        PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
+        std::wstring wstrKey = L"SOFTWARE\\Telvane\\Platform\\StateNotification\\" +
+                               platformtest::StateNameText(stateName).substr(2);
+        ASSERT_EQ(ERROR_SUCCESS,
+                  RegSetKeyValueW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), L"Data", c.dwType,
+                                  c.vbValue.data(), static_cast<DWORD>(c.vbValue.size())))
+            << c.szWhat;
+
+        BYTE rgb[WNF_STATE_MAX_DATA_SIZE];
+        ULONG cb = sizeof(rgb);
+        WNF_CHANGE_STAMP stamp = 0;
+        EXPECT_EQ(static_cast<NTSTATUS>(0xC0070000 | ERROR_INVALID_DATA),
+                  NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, rgb, &cb))
+            << c.szWhat;
+
+        ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 6, &stamp)) << c.szWhat;
+        EXPECT_EQ(1u, stamp) << c.szWhat;
+        ASSERT_TRUE(log.WaitForStamp(1)) << c.szWhat;
+        EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+        std::vector<Delivery> rg = log.Deliveries();
+        ASSERT_EQ(1u, rg.size()) << c.szWhat;
+        EXPECT_EQ(6u, ValueOf(rg[0].vbData)) << c.szWhat;
+    }
+}
