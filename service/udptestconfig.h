@@ -37,6 +37,12 @@ constexpr size_t c_cchUdpRelayNameMax = 253;
 
 void ResetUdpConfig(UdpTestConfig *pConfig);
 
+// The launcher's time gate: true when no test ran yet (lastTest 0), or when the spacing of
+// 1 / maxTestDay days (computed in single precision, as the phone does) has passed strictly
+// before now. A maxTestDay of 0, below 0 or not a number allows no further test, and neither
+// does a spacing too long to count.
+bool UdpTestSpacingPassed(uint64_t ullLastTest, float flMaxTestDay, uint64_t ullNow);
+
 // The relay name goes unquoted onto the test application's command line, so only host names
 // and IP literals pass: letters, digits, '.', '-' and ':', not starting with '-' (it would
 // read as an option), at most c_cchUdpRelayNameMax bytes, not empty.

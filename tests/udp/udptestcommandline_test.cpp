@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <functional>
+#include <limits>
 
 namespace
 {
@@ -126,4 +127,35 @@ TEST(UdpRelayName, NullAndEmptyAreNoRelay)
     EXPECT_TRUE(UdpConfigHasRelay(config));
     config.remoteIp = "null";
     EXPECT_FALSE(UdpConfigHasRelay(config)); // the address replaces the name
+}
+
+TEST(UdpTestSpacing, Table)
+{
+    const uint64_t ullLast = 134000000000000000ull;
+    const uint64_t ullHalfDay = 432000008192ull; // 864000016384 / 2, the single-precision day
+    struct
+    {
+        const char *szName;
+        uint64_t ullLastTest;
+        float flMaxTestDay;
+        uint64_t ullNow;
+        bool fPassed;
+    } rgCases[] = {
+        {"never tested", 0, 0.0f, 1, true},
+        {"two a day: half a day and one tick later", ullLast, 2.0f, ullLast + ullHalfDay + 1, true},
+        {"two a day: exactly half a day later", ullLast, 2.0f, ullLast + ullHalfDay, false},
+        {"one a day: a day later", ullLast, 1.0f, ullLast + 864000016384ull + 1, true},
+        {"one a day: a little less", ullLast, 1.0f, ullLast + 863999999999ull, false},
+        {"zero a day", ullLast, 0.0f, UINT64_MAX, false},
+        {"negative", ullLast, -1.0f, UINT64_MAX, false},
+        {"not a number", ullLast, std::numeric_limits<float>::quiet_NaN(), UINT64_MAX, false},
+        {"a spacing past 64 bits", ullLast, 1e-30f, UINT64_MAX, false},
+        {"a spacing past the end of time", UINT64_MAX - 5, 1.0f, UINT64_MAX, false},
+        {"very many a day", ullLast, 1e30f, ullLast + 1, true},
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(c.szName);
+        EXPECT_EQ(c.fPassed, UdpTestSpacingPassed(c.ullLastTest, c.flMaxTestDay, c.ullNow));
+    }
 }
