@@ -176,6 +176,10 @@ bool IsConfigExpired(const UdpTestConfig *pConfig)
 
 HRESULT ApplyUdpConfig(UdpTestConfig *pConfig, const JsonObjectNode *pRoot)
 {
+    if (pConfig == nullptr || pRoot == nullptr)
+    {
+        return E_POINTER;
+    }
     std::string strText;
     if (pRoot->GetMemberText("Enabled", strText))
     {

@@ -29,10 +29,14 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *pb, size_t cb)
         // A 16-bit day count and its hours, minutes and seconds never overflow the ticks.
         FuzzCheck(IsoDurationTicks(parts) <=
                   65535ull * 86400 * 10000000 + (65535ull * 3600 + 65535ull * 61) * 10000000);
-    }
-    else
-    {
-        FuzzCheck(parts.years == 0 || hr == c_hrIsoDurationInvalid);
+        // A date-only duration followed by an empty time part means the same.
+        if (strText.find('T') == std::string::npos && strlen(sz) == strText.size())
+        {
+            DurationParts partsWithTime;
+            FuzzCheck(ParseIsoDuration((strText + "T").c_str(), &partsWithTime) ==
+                      c_hrIsoDurationOk);
+            FuzzCheck(IsoDurationTicks(partsWithTime) == IsoDurationTicks(parts));
+        }
     }
     return 0;
 }
