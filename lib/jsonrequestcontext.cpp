@@ -154,8 +154,10 @@ HRESULT JsonRequestContext::Start(const JsonRequest &request)
 
     if (request.gzip)
     {
+        // On the session: the platform takes decompression on session and request handles
+        // only, and refuses it on a connection (12018), which would fail every such request.
         DWORD dwDecompression = c_dwDecompressionGzipDeflate;
-        if (!WinHttpSetOption(m_hConnection.Get(), c_dwOptionDecompression, &dwDecompression,
+        if (!WinHttpSetOption(m_hSession.Get(), c_dwOptionDecompression, &dwDecompression,
                               sizeof(dwDecompression)))
         {
             return OrvexJsonTraceLastError(OrvexJsonEvent_Decompression);
