@@ -21,12 +21,12 @@ protected:
     {
         udptest::PreparePolicyFolder();
         udptest::InstallTestApplication();
-        ChamberStandInSetFailure(nullptr, S_OK);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
     void TearDown() override
     {
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, WIFI_STANDIN_KEY);
-        ChamberStandInSetFailure(nullptr, S_OK);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
         RemoveDirectoryW(c_wszUdpConfigTempFile);
         DeleteFileW(c_wszUdpConfigFile);
     }

@@ -119,8 +119,9 @@ protected:
     void SetUp() override
     {
         udptest::InstallTestApplication();
-        ChamberStandInSetFailure(nullptr, S_OK);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
+    void TearDown() override { RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY); }
 };
 } // namespace
 
