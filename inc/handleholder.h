@@ -6,6 +6,7 @@
 
 #include <windows.h>
 #include <wincrypt.h>
+#include <winhttp.h>
 
 template <class Traits>
 class CHandleHolder
@@ -146,6 +147,13 @@ struct HandleTraitsThreadpoolWait
     }
 };
 
+struct HandleTraitsWinHttp // sessions, connections and requests of the platform HTTP client
+{
+    typedef HINTERNET Type;
+    static Type Invalid() { return nullptr; }
+    static BOOL Close(Type h) { return WinHttpCloseHandle(h); }
+};
+
 typedef CHandleHolder<HandleTraitsKernel> CKernelHandle;
 typedef CHandleHolder<HandleTraitsFile> CFileHandle;
 typedef CHandleHolder<HandleTraitsFind> CFindHandle;
@@ -154,3 +162,4 @@ typedef CHandleHolder<HandleTraitsModule> CModuleHandle;
 typedef CHandleHolder<HandleTraitsCertStore> CCertStoreHandle;
 typedef CHandleHolder<HandleTraitsCertContext> CCertContextHandle;
 typedef CHandleHolder<HandleTraitsThreadpoolWait> CThreadpoolWaitHandle;
+typedef CHandleHolder<HandleTraitsWinHttp> CWinHttpHandle;
