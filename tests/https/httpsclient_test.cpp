@@ -178,6 +178,23 @@ protected:
         return false;
     }
 
+    // Every written event has the keyword and level of its class: information (12, 24),
+    // verbose (15, 26, 27, 99) or error (all others).
+    static void ExpectDescriptorsOfTheirClass()
+    {
+        std::lock_guard<std::mutex> guard(s_lock);
+        for (const WrittenEvent &event : s_rgEvents)
+        {
+            bool fInformation = event.usId == 12 || event.usId == 24;
+            bool fVerbose =
+                event.usId == 15 || event.usId == 26 || event.usId == 27 || event.usId == 99;
+            ULONGLONG ullKeyword = fInformation ? 0x2 : fVerbose ? 0x4 : 0x1;
+            UCHAR ucLevel = fInformation ? 4 : fVerbose ? 5 : 2;
+            EXPECT_EQ(ullKeyword, event.ullKeyword) << "event " << event.usId;
+            EXPECT_EQ(ucLevel, event.ucLevel) << "event " << event.usId;
+        }
+    }
+
     static std::string MemberText(const JsonValue *pRoot, const char *szName)
     {
         std::string strText;
@@ -271,6 +288,7 @@ TEST_P(HttpsAnswerTest, CompletesWithTheAnswersOutcome)
     }
     EXPECT_TRUE(FindEvent(12)); // sent
     EXPECT_TRUE(FindEvent(15)); // closed
+    ExpectDescriptorsOfTheirClass();
 }
 
 INSTANTIATE_TEST_SUITE_P(Answers, HttpsAnswerTest, ::testing::ValuesIn(c_rgAnswers),
@@ -662,5 +680,69 @@ TEST_F(HttpsClientTest, ProviderLivesWithTheContexts)
     EXPECT_EQ(S_OK, OrvexJsonClose(pContext));
     EXPECT_EQ(0u, g_OrvexJsonTraceProvider.hRegistration);
     CloseHandle(outcome.hDone);
+}
+// A trace session's level and keywords decide which events of a 404 request are written:
+// 12 (information), 19 (error), 27 and 15 (verbose).
+struct SessionCase
+{
+    const char *szName;
+    USHORT usPort;
+    UCHAR ucLevel;
+    ULONGLONG ullKeywords;
+    std::vector<USHORT> rgIds; // in the order written
+};
+
+void PrintTo(const SessionCase &c, std::ostream *pStream)
+{
+    *pStream << c.szName;
+}
+
+const SessionCase c_rgSessions[] = {
+    {"Everything", 47132, 0, ~0ull, {12, 19, 27, 15}},      {"ErrorsOnly", 47133, 5, 0x1, {19}},
+    {"UpToInformation", 47134, 4, ~0ull, {12, 19}},         {"ErrorLevelOnly", 47135, 2, 0x7, {19}},
+    {"InformationAndVerbose", 47136, 5, 0x6, {12, 27, 15}},
+};
+
+class HttpsSessionTest : public HttpsClientTest, public ::testing::WithParamInterface<SessionCase>
+{
+};
+
+TEST_P(HttpsSessionTest, WritesOnlyWhatTheSessionEnabled)
+{
+    const SessionCase &c = GetParam();
+    PolicyServerOptions options;
+    options.usPort = c.usPort;
+    options.iStatus = 404;
+    CTestPolicyServer server;
+    ASSERT_TRUE(server.Start(options));
+    TraceProviderEnableCallback(&ORVEXJSON_PROVIDER_GUID, EVENT_CONTROL_CODE_ENABLE_PROVIDER,
+                                c.ucLevel, c.ullKeywords, 0, nullptr, &g_OrvexJsonTraceProvider);
+
+    EXPECT_EQ(c_hrStatus, Send(Request(CTestPolicyServer::Url(c.usPort))));
+    EXPECT_EQ(c.rgIds, EventIds());
+}
+
+INSTANTIATE_TEST_SUITE_P(Sessions, HttpsSessionTest, ::testing::ValuesIn(c_rgSessions),
+                         [](const ::testing::TestParamInfo<SessionCase> &info) {
+                             return std::string(info.param.szName);
+                         });
+
+// Where no trace session can listen (Wine), TELVANE_TRACE_STDOUT turns every event of the
+// client's provider on when it registers and echoes each one as a debug line.
+TEST_F(HttpsClientTest, TraceStdoutEchoesTheClientsEvents)
+{
+    TraceProviderEnableCallback(&ORVEXJSON_PROVIDER_GUID, EVENT_CONTROL_CODE_DISABLE_PROVIDER, 0, 0,
+                                0, nullptr, &g_OrvexJsonTraceProvider);
+    ASSERT_TRUE(SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", L"1"));
+    testsupport::LogCapture log;
+
+    JsonRequest request = Request(L"ftp://localhost:47137/v1/api/config/udpecho");
+    HRESULT hr = Send(request);
+    SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", nullptr);
+
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), hr);
+    EXPECT_EQ(std::vector<USHORT>({1}), EventIds());
+    EXPECT_TRUE(log.Contains(L"EventTrace: 1 0x80072ee6"))
+        << testsupport::Narrow(log.Lines().empty() ? std::wstring() : log.Lines().back());
 }
 } // namespace
