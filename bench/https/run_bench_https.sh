@@ -4,11 +4,6 @@
 set -euo pipefail
 root=$(cd "$(dirname "$0")/../.." && pwd)
 build=${1:-$root/build}
-pki=$build/tests/https/pki
 trap 'bash "$root/tests/https/pkifixture.sh" cleanup "$build" >/dev/null' EXIT
 bash "$root/tests/https/pkifixture.sh" setup "$build" >/dev/null
-# The bench reads its certificates where the tests keep them.
-mkdir -p "$build/bench/https"
-rm -rf "$build/bench/https/pki"
-ln -s "$pki" "$build/bench/https/pki"
 "$build/wine-run" "$build/bin/bench_https.exe"
