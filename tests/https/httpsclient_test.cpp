@@ -342,6 +342,73 @@ TEST_F(HttpsClientTest, ServiceSeesTheDeviceCertificateAndThePath)
     EXPECT_NE(std::string::npos, rgRequests[0].find("\"contentType\": \"application/json\""));
 }
 
+TEST_F(HttpsClientTest, ExtraHeadersFollowTheContentType)
+{
+    PolicyServerOptions options;
+    options.usPort = 47138;
+    CTestPolicyServer server;
+    ASSERT_TRUE(server.Start(options));
+
+    JsonRequest request = Request(CTestPolicyServer::Url(options.usPort));
+    request.extraHeaders = L"X-Telvane-Test: seen";
+    ASSERT_EQ(S_OK, Send(request));
+    std::vector<std::string> rgRequests = server.Requests();
+    ASSERT_EQ(1u, rgRequests.size());
+    EXPECT_NE(std::string::npos, rgRequests[0].find("\"extra\": \"seen\"")) << rgRequests[0];
+    EXPECT_NE(std::string::npos, rgRequests[0].find("\"contentType\": \"application/json\""));
+}
+
+// The security flags waive a bad name or date, never an unknown issuer.
+struct IgnoreCase
+{
+    const char *szName;
+    USHORT usPort;
+    const char *szHost;
+    bool fRogue;
+    bool fIgnore;
+    bool fSucceeds;
+};
+
+void PrintTo(const IgnoreCase &c, std::ostream *pStream)
+{
+    *pStream << c.szName;
+}
+
+const IgnoreCase c_rgIgnoreCases[] = {
+    {"NameMismatchFails", 47139, "127.0.0.1", false, false, false},
+    {"NameMismatchIgnored", 47140, "127.0.0.1", false, true, true},
+    {"UntrustedNotIgnored", 47141, "localhost", true, true, false},
+};
+
+class HttpsIgnoreTest : public HttpsClientTest, public ::testing::WithParamInterface<IgnoreCase>
+{
+};
+
+TEST_P(HttpsIgnoreTest, SecurityFlagsWaiveOnlyNameAndDate)
+{
+    const IgnoreCase &c = GetParam();
+    PolicyServerOptions options;
+    options.usPort = c.usPort;
+    options.fRogueCertificate = c.fRogue;
+    options.cLifetimeSeconds = 10;
+    CTestPolicyServer server;
+    ASSERT_TRUE(server.Start(options));
+
+    std::string strUrl = std::string("https://") + c.szHost + ":" + std::to_string(c.usPort) +
+                         "/v1/api/config/udpecho";
+    JsonRequest request = Request(std::wstring(strUrl.begin(), strUrl.end()));
+    request.ignoreCertErrors = c.fIgnore;
+    HRESULT hr = Send(request);
+    EXPECT_EQ(c.fSucceeds, SUCCEEDED(hr)) << std::hex << hr;
+    EXPECT_FALSE(FindEvent(10)); // the flags were taken
+    EXPECT_EQ(c.fSucceeds ? 1u : 0u, server.Requests().size());
+}
+
+INSTANTIATE_TEST_SUITE_P(SecurityFlags, HttpsIgnoreTest, ::testing::ValuesIn(c_rgIgnoreCases),
+                         [](const ::testing::TestParamInfo<IgnoreCase> &info) {
+                             return std::string(info.param.szName);
+                         });
+
 TEST_F(HttpsClientTest, HttpSchemeStillGoesOverTls)
 {
     PolicyServerOptions options;
