@@ -10,6 +10,8 @@
 #include "tests/common/testsupport.h"
 #include "tests/https/testpolicyserver.h"
 
+#include <winsock2.h>
+
 #include <gtest/gtest.h>
 #include <memory>
 #include <mutex>
@@ -811,5 +813,61 @@ TEST_F(HttpsClientTest, TraceStdoutEchoesTheClientsEvents)
     EXPECT_EQ(std::vector<USHORT>({1}), EventIds());
     EXPECT_TRUE(log.Contains(L"EventTrace: 1 0x80072ee6"))
         << testsupport::Narrow(log.Lines().empty() ? std::wstring() : log.Lines().back());
+}
+// Wine never reports a secure failure (its TLS failures all come as request error 12157),
+// so this case hands the status callback the notification itself, while the real request
+// waits on a listener that never answers its handshake. The completion runs once, with
+// E_ACCESSDENIED; the real failure that follows calls nothing more.
+TEST_F(HttpsClientTest, SecureFailureCompletesOnce)
+{
+    WSADATA wsa;
+    ASSERT_EQ(0, WSAStartup(MAKEWORD(2, 2), &wsa));
+    SOCKET listener = socket(AF_INET, SOCK_STREAM, IPPROTO_TCP);
+    ASSERT_NE(INVALID_SOCKET, listener);
+    sockaddr_in address = {};
+    address.sin_family = AF_INET;
+    address.sin_port = htons(47142);
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    ASSERT_EQ(0, bind(listener, reinterpret_cast<sockaddr *>(&address), sizeof(address)));
+    ASSERT_EQ(0, listen(listener, 4));
+
+    struct Outcome
+    {
+        LONG cCalls = 0;
+        HRESULT hr = S_OK;
+        HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    } outcome;
+    auto complete = [](void *pv, HRESULT hr, JsonValue *pRoot) {
+        Outcome *p = static_cast<Outcome *>(pv);
+        InterlockedIncrement(&p->cCalls);
+        p->hr = hr;
+        delete pRoot;
+        SetEvent(p->hDone);
+    };
+    JsonRequest request = Request(CTestPolicyServer::Url(47142));
+    JsonRequestContext *pContext = nullptr;
+    ASSERT_EQ(S_OK, OrvexJsonSend(&request, complete, &outcome, &pContext));
+
+    DWORD dwFlags = WINHTTP_CALLBACK_STATUS_FLAG_INVALID_CA;
+    OrvexJsonStatusCallback(nullptr, 0, WINHTTP_CALLBACK_STATUS_SECURE_FAILURE, &dwFlags,
+                            sizeof(dwFlags)); // no context: ignored
+    EXPECT_EQ(0, outcome.cCalls);
+    OrvexJsonStatusCallback(nullptr, reinterpret_cast<DWORD_PTR>(pContext),
+                            WINHTTP_CALLBACK_STATUS_SECURE_FAILURE, &dwFlags, sizeof(dwFlags));
+    EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(outcome.hDone, INFINITE));
+    EXPECT_EQ(c_hrAccessDenied, outcome.hr);
+    WrittenEvent event{};
+    ASSERT_TRUE(FindEvent(16, &event));
+    EXPECT_EQ(static_cast<ULONG>(WINHTTP_CALLBACK_STATUS_FLAG_INVALID_CA), event.Code());
+
+    // Closing the listener resets the waiting connection: the handshake then fails for real
+    // and its request error finds the completion already taken.
+    closesocket(listener);
+    EXPECT_EQ(S_OK, OrvexJsonClose(pContext));
+    EXPECT_EQ(1, outcome.cCalls);
+    EXPECT_EQ(c_hrAccessDenied, outcome.hr);
+    EXPECT_TRUE(FindEvent(22)); // the real failure came, and called nothing
+    WSACleanup();
+    CloseHandle(outcome.hDone);
 }
 } // namespace
