@@ -675,8 +675,8 @@ const EarlyFailureCase c_rgEarlyFailures[] = {
     {"UnknownScheme", L"ftp://localhost:47127/v1/api/config/udpecho", false,
      HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), 1},
     {"NotAUrl", L"not a url", false, HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), 1},
-    // Wine does not implement decompression (option 118, 12009); the option goes on the
-    // session, since a connection handle refuses it on every platform (12018).
+    // Wine does not implement decompression (option 118, 12009) on the session, where the
+    // client sets it; a connection handle refuses it outright (12018).
     {"GzipUnderWine", L"https://localhost:47128/v1/api/config/udpecho", true,
      HRESULT_FROM_WIN32(ERROR_WINHTTP_INVALID_OPTION), 3},
 };
