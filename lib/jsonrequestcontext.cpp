@@ -154,8 +154,9 @@ HRESULT JsonRequestContext::Start(const JsonRequest &request)
 
     if (request.gzip)
     {
-        // On the session: the platform takes decompression on session and request handles
-        // only, and refuses it on a connection (12018), which would fail every such request.
+        // On the session, which passes it to its requests: the option belongs to session and
+        // request handles, and a connection handle refuses it (12018, incorrect handle
+        // type), which failed every such request before it was sent.
         DWORD dwDecompression = c_dwDecompressionGzipDeflate;
         if (!WinHttpSetOption(m_hSession.Get(), c_dwOptionDecompression, &dwDecompression,
                               sizeof(dwDecompression)))

@@ -10,6 +10,8 @@
 #include "tests/common/testsupport.h"
 #include "tests/https/testpolicyserver.h"
 
+#include <winsock2.h>
+
 #include <gtest/gtest.h>
 #include <memory>
 #include <mutex>
@@ -178,6 +180,23 @@ protected:
         return false;
     }
 
+    // Every written event has the keyword and level of its class: information (12, 24),
+    // verbose (15, 26, 27, 99) or error (all others).
+    static void ExpectDescriptorsOfTheirClass()
+    {
+        std::lock_guard<std::mutex> guard(s_lock);
+        for (const WrittenEvent &event : s_rgEvents)
+        {
+            bool fInformation = event.usId == 12 || event.usId == 24;
+            bool fVerbose =
+                event.usId == 15 || event.usId == 26 || event.usId == 27 || event.usId == 99;
+            ULONGLONG ullKeyword = fInformation ? 0x2 : fVerbose ? 0x4 : 0x1;
+            UCHAR ucLevel = fInformation ? 4 : fVerbose ? 5 : 2;
+            EXPECT_EQ(ullKeyword, event.ullKeyword) << "event " << event.usId;
+            EXPECT_EQ(ucLevel, event.ucLevel) << "event " << event.usId;
+        }
+    }
+
     static std::string MemberText(const JsonValue *pRoot, const char *szName)
     {
         std::string strText;
@@ -271,6 +290,7 @@ TEST_P(HttpsAnswerTest, CompletesWithTheAnswersOutcome)
     }
     EXPECT_TRUE(FindEvent(12)); // sent
     EXPECT_TRUE(FindEvent(15)); // closed
+    ExpectDescriptorsOfTheirClass();
 }
 
 INSTANTIATE_TEST_SUITE_P(Answers, HttpsAnswerTest, ::testing::ValuesIn(c_rgAnswers),
@@ -323,6 +343,73 @@ TEST_F(HttpsClientTest, ServiceSeesTheDeviceCertificateAndThePath)
     EXPECT_NE(std::string::npos, rgRequests[0].find("\"method\": \"GET\""));
     EXPECT_NE(std::string::npos, rgRequests[0].find("\"contentType\": \"application/json\""));
 }
+
+TEST_F(HttpsClientTest, ExtraHeadersFollowTheContentType)
+{
+    PolicyServerOptions options;
+    options.usPort = 47138;
+    CTestPolicyServer server;
+    ASSERT_TRUE(server.Start(options));
+
+    JsonRequest request = Request(CTestPolicyServer::Url(options.usPort));
+    request.extraHeaders = L"X-Telvane-Test: seen";
+    ASSERT_EQ(S_OK, Send(request));
+    std::vector<std::string> rgRequests = server.Requests();
+    ASSERT_EQ(1u, rgRequests.size());
+    EXPECT_NE(std::string::npos, rgRequests[0].find("\"extra\": \"seen\"")) << rgRequests[0];
+    EXPECT_NE(std::string::npos, rgRequests[0].find("\"contentType\": \"application/json\""));
+}
+
+// The security flags waive a bad name or date, never an unknown issuer.
+struct IgnoreCase
+{
+    const char *szName;
+    USHORT usPort;
+    const char *szHost;
+    bool fRogue;
+    bool fIgnore;
+    bool fSucceeds;
+};
+
+void PrintTo(const IgnoreCase &c, std::ostream *pStream)
+{
+    *pStream << c.szName;
+}
+
+const IgnoreCase c_rgIgnoreCases[] = {
+    {"NameMismatchFails", 47139, "127.0.0.1", false, false, false},
+    {"NameMismatchIgnored", 47140, "127.0.0.1", false, true, true},
+    {"UntrustedNotIgnored", 47141, "localhost", true, true, false},
+};
+
+class HttpsIgnoreTest : public HttpsClientTest, public ::testing::WithParamInterface<IgnoreCase>
+{
+};
+
+TEST_P(HttpsIgnoreTest, SecurityFlagsWaiveOnlyNameAndDate)
+{
+    const IgnoreCase &c = GetParam();
+    PolicyServerOptions options;
+    options.usPort = c.usPort;
+    options.fRogueCertificate = c.fRogue;
+    options.cLifetimeSeconds = 10;
+    CTestPolicyServer server;
+    ASSERT_TRUE(server.Start(options));
+
+    std::string strUrl = std::string("https://") + c.szHost + ":" + std::to_string(c.usPort) +
+                         "/v1/api/config/udpecho";
+    JsonRequest request = Request(std::wstring(strUrl.begin(), strUrl.end()));
+    request.ignoreCertErrors = c.fIgnore;
+    HRESULT hr = Send(request);
+    EXPECT_EQ(c.fSucceeds, SUCCEEDED(hr)) << std::hex << hr;
+    EXPECT_FALSE(FindEvent(10)); // the flags were taken
+    EXPECT_EQ(c.fSucceeds ? 1u : 0u, server.Requests().size());
+}
+
+INSTANTIATE_TEST_SUITE_P(SecurityFlags, HttpsIgnoreTest, ::testing::ValuesIn(c_rgIgnoreCases),
+                         [](const ::testing::TestParamInfo<IgnoreCase> &info) {
+                             return std::string(info.param.szName);
+                         });
 
 TEST_F(HttpsClientTest, HttpSchemeStillGoesOverTls)
 {
@@ -588,8 +675,8 @@ const EarlyFailureCase c_rgEarlyFailures[] = {
     {"UnknownScheme", L"ftp://localhost:47127/v1/api/config/udpecho", false,
      HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), 1},
     {"NotAUrl", L"not a url", false, HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), 1},
-    // Wine does not implement decompression (option 118, 12009); the option goes on the
-    // session, since a connection handle refuses it on every platform (12018).
+    // Wine does not implement decompression (option 118, 12009) on the session, where the
+    // client sets it; a connection handle refuses it outright (12018).
     {"GzipUnderWine", L"https://localhost:47128/v1/api/config/udpecho", true,
      HRESULT_FROM_WIN32(ERROR_WINHTTP_INVALID_OPTION), 3},
 };
@@ -661,6 +748,126 @@ TEST_F(HttpsClientTest, ProviderLivesWithTheContexts)
     delete outcome.pRoot;
     EXPECT_EQ(S_OK, OrvexJsonClose(pContext));
     EXPECT_EQ(0u, g_OrvexJsonTraceProvider.hRegistration);
+    CloseHandle(outcome.hDone);
+}
+// A trace session's level and keywords decide which events of a 404 request are written:
+// 12 (information), 19 (error), 27 and 15 (verbose).
+struct SessionCase
+{
+    const char *szName;
+    USHORT usPort;
+    UCHAR ucLevel;
+    ULONGLONG ullKeywords;
+    std::vector<USHORT> rgIds; // in the order written
+};
+
+void PrintTo(const SessionCase &c, std::ostream *pStream)
+{
+    *pStream << c.szName;
+}
+
+const SessionCase c_rgSessions[] = {
+    {"Everything", 47132, 0, ~0ull, {12, 19, 27, 15}},      {"ErrorsOnly", 47133, 5, 0x1, {19}},
+    {"UpToInformation", 47134, 4, ~0ull, {12, 19}},         {"ErrorLevelOnly", 47135, 2, 0x7, {19}},
+    {"InformationAndVerbose", 47136, 5, 0x6, {12, 27, 15}},
+};
+
+class HttpsSessionTest : public HttpsClientTest, public ::testing::WithParamInterface<SessionCase>
+{
+};
+
+TEST_P(HttpsSessionTest, WritesOnlyWhatTheSessionEnabled)
+{
+    const SessionCase &c = GetParam();
+    PolicyServerOptions options;
+    options.usPort = c.usPort;
+    options.iStatus = 404;
+    CTestPolicyServer server;
+    ASSERT_TRUE(server.Start(options));
+    TraceProviderEnableCallback(&ORVEXJSON_PROVIDER_GUID, EVENT_CONTROL_CODE_ENABLE_PROVIDER,
+                                c.ucLevel, c.ullKeywords, 0, nullptr, &g_OrvexJsonTraceProvider);
+
+    EXPECT_EQ(c_hrStatus, Send(Request(CTestPolicyServer::Url(c.usPort))));
+    EXPECT_EQ(c.rgIds, EventIds());
+}
+
+INSTANTIATE_TEST_SUITE_P(Sessions, HttpsSessionTest, ::testing::ValuesIn(c_rgSessions),
+                         [](const ::testing::TestParamInfo<SessionCase> &info) {
+                             return std::string(info.param.szName);
+                         });
+
+// Where no trace session can listen (Wine), TELVANE_TRACE_STDOUT turns every event of the
+// client's provider on when it registers and echoes each one as a debug line.
+TEST_F(HttpsClientTest, TraceStdoutEchoesTheClientsEvents)
+{
+    TraceProviderEnableCallback(&ORVEXJSON_PROVIDER_GUID, EVENT_CONTROL_CODE_DISABLE_PROVIDER, 0, 0,
+                                0, nullptr, &g_OrvexJsonTraceProvider);
+    ASSERT_TRUE(SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", L"1"));
+    testsupport::LogCapture log;
+
+    JsonRequest request = Request(L"ftp://localhost:47137/v1/api/config/udpecho");
+    HRESULT hr = Send(request);
+    SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", nullptr);
+
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), hr);
+    EXPECT_EQ(std::vector<USHORT>({1}), EventIds());
+    EXPECT_TRUE(log.Contains(L"EventTrace: 1 0x80072ee6"))
+        << testsupport::Narrow(log.Lines().empty() ? std::wstring() : log.Lines().back());
+}
+// Wine never reports a secure failure (its TLS failures all come as request error 12157),
+// so this case hands the status callback the notification itself, while the real request
+// waits on a listener that never answers its handshake. The completion runs once, with
+// E_ACCESSDENIED; the real failure that follows calls nothing more.
+TEST_F(HttpsClientTest, SecureFailureCompletesOnce)
+{
+    WSADATA wsa;
+    ASSERT_EQ(0, WSAStartup(MAKEWORD(2, 2), &wsa));
+    SOCKET listener = socket(AF_INET, SOCK_STREAM, IPPROTO_TCP);
+    ASSERT_NE(INVALID_SOCKET, listener);
+    sockaddr_in address = {};
+    address.sin_family = AF_INET;
+    address.sin_port = htons(47142);
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    ASSERT_EQ(0, bind(listener, reinterpret_cast<sockaddr *>(&address), sizeof(address)));
+    ASSERT_EQ(0, listen(listener, 4));
+
+    struct Outcome
+    {
+        LONG cCalls = 0;
+        HRESULT hr = S_OK;
+        HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    } outcome;
+    auto complete = [](void *pv, HRESULT hr, JsonValue *pRoot) {
+        Outcome *p = static_cast<Outcome *>(pv);
+        InterlockedIncrement(&p->cCalls);
+        p->hr = hr;
+        delete pRoot;
+        SetEvent(p->hDone);
+    };
+    JsonRequest request = Request(CTestPolicyServer::Url(47142));
+    JsonRequestContext *pContext = nullptr;
+    ASSERT_EQ(S_OK, OrvexJsonSend(&request, complete, &outcome, &pContext));
+
+    DWORD dwFlags = WINHTTP_CALLBACK_STATUS_FLAG_INVALID_CA;
+    OrvexJsonStatusCallback(nullptr, 0, WINHTTP_CALLBACK_STATUS_SECURE_FAILURE, &dwFlags,
+                            sizeof(dwFlags)); // no context: ignored
+    EXPECT_EQ(0, outcome.cCalls);
+    OrvexJsonStatusCallback(nullptr, reinterpret_cast<DWORD_PTR>(pContext),
+                            WINHTTP_CALLBACK_STATUS_SECURE_FAILURE, &dwFlags, sizeof(dwFlags));
+    EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(outcome.hDone, INFINITE));
+    EXPECT_EQ(c_hrAccessDenied, outcome.hr);
+    WrittenEvent event{};
+    ASSERT_TRUE(FindEvent(16, &event));
+    EXPECT_EQ(static_cast<ULONG>(WINHTTP_CALLBACK_STATUS_FLAG_INVALID_CA), event.Code());
+
+    // Closing the listener resets the waiting connection: the handshake then fails for real
+    // and its request error finds the completion already taken.
+    closesocket(listener);
+    EXPECT_EQ(S_OK, OrvexJsonClose(pContext));
+    EXPECT_EQ(1, outcome.cCalls);
+    EXPECT_EQ(c_hrAccessDenied, outcome.hr);
+    EXPECT_TRUE(FindEvent(22)); // the real failure came, and called nothing
+    WSACleanup();
     CloseHandle(outcome.hDone);
 }
 } // namespace

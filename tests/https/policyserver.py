@@ -89,7 +89,8 @@ def main():
                 with open(args.log, "a") as f:
                     f.write(json.dumps({"path": self.path, "method": self.command,
                                         "client": cn,
-                                        "contentType": self.headers.get("Content-Type", "")})
+                                        "contentType": self.headers.get("Content-Type", ""),
+                                        "extra": self.headers.get("X-Telvane-Test", "")})
                             + "\n")
             self.send_response(args.status)
             self.send_header("Content-Type", "application/json")
