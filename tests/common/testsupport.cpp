@@ -160,7 +160,7 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
     if (!fCreated)
     {
         result.dwExitCode = GetLastError();
-        result.strOutput = "CreateProcess failed";
+        result.strOutput = "CreateProcess failed: " + std::to_string(result.dwExitCode);
         CloseHandle(hRead);
         return result;
     }
