@@ -605,6 +605,9 @@ TEST_F(TraceDocumentTest, ConnIdGivesTheConnectionOrTheZeroGuid)
         {"short text", 2, L"home", "home"},
         {"36 characters without a terminator", 3, L"5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5B",
          "5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5B"},
+        // 74 bytes fit the buffer exactly; the text stops at 36 characters all the same.
+        {"37 characters without a terminator", 3, L"5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5BC",
+         "5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5B"},
     };
     for (const Row &row : rgRows)
     {

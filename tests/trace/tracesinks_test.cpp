@@ -148,10 +148,17 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
                   session.CountMessages(c_szJustFile));
         EXPECT_EQ(row.cFiles == 1 && row.cSubmissions == 1 ? 1u : 0u,
                   session.CountMessages(c_szBoth));
-        // File and submission carry the same text: the log with "LogEnd".
+        // File and submission carry the same text: the log with "LogEnd"; the file comes
+        // first.
         if (row.cFiles == 1 && row.cSubmissions == 1)
         {
             EXPECT_EQ(rgFiles[0], rgSubmissions[0].strData);
+            std::vector<std::string> rgLines = session.Lines();
+            auto itFile = std::find(rgLines.begin(), rgLines.end(),
+                                    std::string("1001|") + c_szWritingFile);
+            auto itVantor = std::find(rgLines.begin(), rgLines.end(),
+                                      std::string("1001|") + c_szWritingVantor);
+            EXPECT_LT(itFile, itVantor);
         }
         for (const SUBMISSION_RECORD &submission : rgSubmissions)
         {
