@@ -154,10 +154,10 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
         {
             EXPECT_EQ(rgFiles[0], rgSubmissions[0].strData);
             std::vector<std::string> rgLines = session.Lines();
-            auto itFile = std::find(rgLines.begin(), rgLines.end(),
-                                    std::string("1001|") + c_szWritingFile);
-            auto itVantor = std::find(rgLines.begin(), rgLines.end(),
-                                      std::string("1001|") + c_szWritingVantor);
+            auto itFile =
+                std::find(rgLines.begin(), rgLines.end(), std::string("1001|") + c_szWritingFile);
+            auto itVantor =
+                std::find(rgLines.begin(), rgLines.end(), std::string("1001|") + c_szWritingVantor);
             EXPECT_LT(itFile, itVantor);
         }
         for (const SUBMISSION_RECORD &submission : rgSubmissions)
