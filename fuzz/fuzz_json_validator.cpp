@@ -4,7 +4,7 @@
 // the text is ASCII without a lone low surrogate escape: beyond that RapidJSON 1.1 is laxer
 // (it lets such escapes through, and a UTF-8 sequence cut off by the end of the text).
 // A text the validator accepts must also stay valid inside an array and invalid with a
-// stray byte after it.
+// stray byte after it; a nesting bound must count the levels exactly.
 #include "lib/jsonvalidator.h"
 
 #include <rapidjson/document.h>
@@ -71,6 +71,16 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *pbData, size_t cbData)
         {
             std::abort();
         }
+    }
+    // A depth bound only refuses more: one more level around the text takes one more level
+    // of bound, and a looser bound never refuses what a tighter one took.
+    size_t cMaxDepth = cbData > 0 ? pbData[0] % 8 : 0;
+    bool fBounded = JsonValidateText(str, cMaxDepth);
+    if ((fBounded && !fValid) ||
+        (fValid && fBounded != JsonValidateText("[" + str + "]", cMaxDepth + 1)) ||
+        (fBounded && !JsonValidateText(str, cMaxDepth + 1)))
+    {
+        std::abort();
     }
     return 0;
 }

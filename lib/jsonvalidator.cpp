@@ -8,9 +8,10 @@ namespace
 class CJsonValidator
 {
 public:
-    explicit CJsonValidator(std::string_view text)
+    CJsonValidator(std::string_view text, size_t cMaxDepth)
         : m_p(reinterpret_cast<const uint8_t *>(text.data()))
         , m_pEnd(m_p + text.size())
+        , m_cMaxDepth(cMaxDepth)
     {
     }
 
@@ -50,6 +51,7 @@ private:
 
     const uint8_t *m_p;
     const uint8_t *const m_pEnd;
+    const size_t m_cMaxDepth;
     std::vector<uint8_t> m_rgbOpen; // '{' or '[' of each open container, innermost last
 };
 
@@ -112,6 +114,10 @@ bool CJsonValidator::Run()
             continue;
         }
         // A value.
+        if ((*m_p == '{' || *m_p == '[') && m_rgbOpen.size() >= m_cMaxDepth)
+        {
+            return false;
+        }
         switch (*m_p)
         {
         case '{':
@@ -380,8 +386,8 @@ bool CJsonValidator::Utf8Sequence()
 }
 } // namespace
 
-bool JsonValidateText(std::string_view text)
+bool JsonValidateText(std::string_view text, size_t cMaxDepth)
 {
-    CJsonValidator validator(text);
+    CJsonValidator validator(text, cMaxDepth);
     return validator.Run();
 }

@@ -5,11 +5,14 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <string_view>
 
 // True when the bytes are exactly one JSON value with nothing but JSON white space around
 // it. Rejected besides what the grammar rejects: malformed or overlong UTF-8, encoded
 // surrogates and code points past U+10FFFF, and \u escapes that do not form valid UTF-16
 // (a high surrogate not followed by a low one, a lone low surrogate). A zero byte is
-// never part of a JSON text.
-bool JsonValidateText(std::string_view text);
+// never part of a JSON text. With cMaxDepth, containers nested deeper than that are refused
+// as well (0: only a scalar passes), for texts that go inside a document whose readers bound
+// its depth.
+bool JsonValidateText(std::string_view text, size_t cMaxDepth = SIZE_MAX);

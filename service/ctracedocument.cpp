@@ -1,6 +1,7 @@
 #include "service/ctracedocument.h"
 
 #include "inc/handleholder.h"
+#include "lib/jsonreader.h"
 #include "lib/jsonvalidator.h"
 #include "platform/deviceinfo/deviceinfo.h"
 #include "service/tracesinks.h"
@@ -15,6 +16,10 @@ const wchar_t c_wszConnIdKey[] = L"System\\CurrentControlSet\\Services\\Ambrel\\
 const wchar_t c_wszConnIdValue[] = L"ConnID";
 const wchar_t c_wszZeroGuid[] = L"00000000-0000-0000-0000-000000000000";
 const DWORD c_cchPhoneBuffer = 1024;
+// A record's value sits inside the log, its group's array and the record: deeper values
+// would take the log past the depth our reader, and many others, will read, and with it
+// every other record of the log.
+const size_t c_cMaxValueDepth = JsonReader::c_cMaxDepth - 3;
 
 // What a log's text holds beside the record values: the header with the device description,
 // each record's {"TimeStamp":...,"Value":} and each group's "ID<guid>":[].
@@ -238,7 +243,7 @@ void CTraceDocument::RecordEvent(const GUID &id, const BYTE *pbValue, size_t cbV
                       : cbValue;
     }
     std::string_view strKept(pbValue != nullptr ? pchValue : "", cchKept);
-    if (cbValue > 0 && cbValue <= 0xFFFFFFFFull && JsonValidateText(strKept))
+    if (cbValue > 0 && cbValue <= 0xFFFFFFFFull && JsonValidateText(strKept, c_cMaxValueDepth))
     {
         pRecord->AddRawJson("Value", pchValue, static_cast<DWORD>(cbValue));
         m_cbRecorded += cchKept;

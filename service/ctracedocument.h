@@ -28,8 +28,9 @@ public:
     void Begin(const GUID &activityId, const GUID &sessionId, const GUID &logId);
 
     // One record {TimeStamp, Value} appended to the group of id; pbValue/cbValue is the
-    // client's payload, kept up to its first NUL. A payload that is not one JSON text is
-    // kept as a JSON string of its bytes, so one faulty client cannot spoil the document.
+    // client's payload, kept up to its first NUL. A payload that is not one JSON text, or
+    // nests deeper than the document's readers take, is kept as a JSON string of its bytes,
+    // so one faulty client cannot spoil the document.
     void RecordEvent(const GUID &id, const BYTE *pbValue, size_t cbValue);
 
     // "ExecutionTime" (now) on the open log; left out when the clock cannot be read.

@@ -135,8 +135,10 @@ HRESULT MakeTraceFileName(std::wstring &wstrPath)
 {
     wstrPath = c_wszTraceDirectory;
     // Only the last folder is made: a device without C:\Data\Test is not a test device.
+    // Another operation flushing at the same moment may make it between the look and the
+    // create; its folder serves this log as well.
     if (GetFileAttributesW(wstrPath.c_str()) == INVALID_FILE_ATTRIBUTES &&
-        !CreateDirectoryW(wstrPath.c_str(), nullptr))
+        !CreateDirectoryW(wstrPath.c_str(), nullptr) && GetLastError() != ERROR_ALREADY_EXISTS)
     {
         return E_FAIL;
     }

@@ -132,3 +132,34 @@ TEST(JsonValidator, NestingDepthCostsNoStack)
     strObjects.append(cDepth / 10, '}');
     EXPECT_TRUE(JsonValidateText(strObjects));
 }
+
+TEST(JsonValidator, RefusesContainersNestedPastTheBound)
+{
+    struct Row
+    {
+        std::string strText;
+        size_t cMaxDepth;
+        bool fValid;
+    };
+    const Row rgRows[] = {
+        {"1", 0, true},
+        {"\"[[{\"", 0, true},
+        {"[]", 0, false},
+        {"{}", 1, true},
+        {"[[1]]", 1, false},
+        {"[[1]]", 2, true},
+        {"[[],[],{\"a\":[]}]", 3, true},
+        {"[[],[],{\"a\":[]}]", 2, false},
+        {"{\"a\":{\"b\":[{}]}}", 4, true},
+        {"{\"a\":{\"b\":[{}]}}", 3, false},
+        {std::string(253, '[') + std::string(253, ']'), 253, true},
+        {std::string(254, '[') + std::string(254, ']'), 253, false},
+    };
+    for (const Row &row : rgRows)
+    {
+        SCOPED_TRACE(row.strText.substr(0, 40) + " within " + std::to_string(row.cMaxDepth));
+        EXPECT_EQ(row.fValid, JsonValidateText(row.strText, row.cMaxDepth));
+        // Without a bound, each of them is JSON.
+        EXPECT_TRUE(JsonValidateText(row.strText));
+    }
+}

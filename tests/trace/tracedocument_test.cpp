@@ -4,12 +4,14 @@
 // is read back by RapidJSON, strictly.
 #include "service/ctracedocument.h"
 
+#include "lib/jsonreader.h"
 #include "platform/deviceinfo/deviceinfocontrol.h"
 #include "tests/trace/tracetestsupport.h"
 
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -430,6 +432,43 @@ TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
     }
 }
 
+// A value nested so deep that the trace around it passes the depth our reader (and many
+// others) will read would make every other record of the log unreadable with it: such a
+// value is kept as a string too.
+TEST_F(TraceDocumentTest, ValuesNestedPastTheReadersDepthBecomeStrings)
+{
+    // The trace's own levels: the log, the group's array, the record.
+    const size_t c_cValueDepth = JsonReader::c_cMaxDepth - 3;
+    auto nested = [](size_t cDepth) {
+        return std::string(cDepth, '[') + "1" + std::string(cDepth, ']');
+    };
+    AllowDelivery(1);
+    TraceSession session;
+    CTraceDocument document;
+    document.Begin(c_guidActivity, c_guidSession, c_guidLog);
+    Record(document, c_guidEventA, nested(c_cValueDepth));
+    Record(document, c_guidEventA, nested(c_cValueDepth + 1));
+    Record(document, c_guidEventA, nested(1000));
+    EXPECT_EQ(2u, session.CountMessages(c_szReplaced));
+    document.FlushAndRestart(true);
+
+    std::vector<std::string> rgTexts = TraceFileTexts();
+    ASSERT_EQ(1u, rgTexts.size());
+    std::unique_ptr<JsonValue> root(JsonReader::FromJsonString(rgTexts[0].c_str()));
+    ASSERT_EQ(JsonNodeType::Object, root->Type());
+    std::string strLogId;
+    EXPECT_TRUE(static_cast<const JsonObjectNode *>(root.get())->GetMemberText("LogID", strLogId));
+    EXPECT_EQ(GuidText(c_guidLog), strLogId);
+
+    rapidjson::Document trace;
+    ParseStrict(rgTexts[0], trace);
+    const rapidjson::Value &group = trace[("ID" + GuidText(c_guidEventA)).c_str()];
+    ASSERT_EQ(3u, group.Size());
+    EXPECT_TRUE(group[0]["Value"].IsArray());
+    EXPECT_EQ(nested(c_cValueDepth + 1), group[1]["Value"].GetString());
+    EXPECT_EQ(nested(1000), group[2]["Value"].GetString());
+}
+
 TEST_F(TraceDocumentTest, PhoneDescribesTheDeviceAsTheLibraryAnswers)
 {
     struct Row
@@ -565,6 +604,9 @@ TEST_F(TraceDocumentTest, ConnIdGivesTheConnectionOrTheZeroGuid)
         {"GUID in braces does not fit", 2, L"{5a3f0c1e-2b4d-4e6f-8a9b-0c1d2e3f4a5b}", strZero},
         {"short text", 2, L"home", "home"},
         {"36 characters without a terminator", 3, L"5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5B",
+         "5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5B"},
+        // 74 bytes fit the buffer exactly; the text stops at 36 characters all the same.
+        {"37 characters without a terminator", 3, L"5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5BC",
          "5A3F0C1E-2B4D-4E6F-8A9B-0C1D2E3F4A5B"},
     };
     for (const Row &row : rgRows)

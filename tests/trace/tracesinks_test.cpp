@@ -4,6 +4,7 @@
 #include "service/ctracedocument.h"
 #include "service/tracesinks.h"
 
+#include "inc/handleholder.h"
 #include "platform/submission/submissioncontrol.h"
 #include "tests/trace/tracetestsupport.h"
 
@@ -13,6 +14,7 @@
 
 #include <algorithm>
 #include <string>
+#include <thread>
 #include <vector>
 
 using namespace tracetest;
@@ -146,10 +148,17 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
                   session.CountMessages(c_szJustFile));
         EXPECT_EQ(row.cFiles == 1 && row.cSubmissions == 1 ? 1u : 0u,
                   session.CountMessages(c_szBoth));
-        // File and submission carry the same text: the log with "LogEnd".
+        // File and submission carry the same text: the log with "LogEnd"; the file comes
+        // first.
         if (row.cFiles == 1 && row.cSubmissions == 1)
         {
             EXPECT_EQ(rgFiles[0], rgSubmissions[0].strData);
+            std::vector<std::string> rgLines = session.Lines();
+            auto itFile =
+                std::find(rgLines.begin(), rgLines.end(), std::string("1001|") + c_szWritingFile);
+            auto itVantor =
+                std::find(rgLines.begin(), rgLines.end(), std::string("1001|") + c_szWritingVantor);
+            EXPECT_LT(itFile, itVantor);
         }
         for (const SUBMISSION_RECORD &submission : rgSubmissions)
         {
@@ -221,6 +230,39 @@ TEST_F(TraceSinksTest, AFolderInTheWayOrAFileNamedLikeTheFolderStopsOnlyTheFile)
     FlushOneLog();
     EXPECT_EQ(1u, SubmissionList().size());
     DeleteFileW(TraceSinks::c_wszTraceDirectory);
+}
+
+// Operations flush on their own threads: when the folder is missing, several of them may
+// find it missing and all try to create it; the ones that lose that race still get a name.
+TEST_F(TraceSinksTest, FlushesRacingToCreateTheFolderAllGetAName)
+{
+    const int c_cRounds = 40;
+    const int c_cThreads = 4;
+    int cFailed = 0;
+    for (int iRound = 0; iRound < c_cRounds; iRound++)
+    {
+        RemoveDirectoryTree(TraceSinks::c_wszTraceDirectory);
+        ASSERT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(TraceSinks::c_wszTraceDirectory));
+        CKernelHandle start(CreateEventW(nullptr, TRUE, FALSE, nullptr));
+        ASSERT_TRUE(start.IsValid());
+        HRESULT rghr[c_cThreads];
+        std::vector<std::thread> rgThreads;
+        for (int i = 0; i < c_cThreads; i++)
+        {
+            rgThreads.emplace_back([&, i]() {
+                WaitForSingleObject(start.Get(), INFINITE);
+                std::wstring wstrPath;
+                rghr[i] = TraceSinks::MakeTraceFileName(wstrPath);
+            });
+        }
+        SetEvent(start.Get());
+        for (int i = 0; i < c_cThreads; i++)
+        {
+            rgThreads[i].join();
+            cFailed += rghr[i] == S_OK ? 0 : 1;
+        }
+    }
+    EXPECT_EQ(0, cFailed) << "of " << c_cRounds * c_cThreads;
 }
 
 TEST_F(TraceSinksTest, TheSubmissionCarriesTheProfileInTheLibrarysCallOrder)
