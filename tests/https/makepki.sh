@@ -20,12 +20,32 @@ ca() { # NAME SUBJECT
     -addext keyUsage=critical,keyCertSign,cRLSign 2>/dev/null
 }
 
+# Wine's TLS client fails to sign with an imported key one of whose private numbers is
+# shorter than its nominal size (a coefficient of 127 bytes gave "GnuTLS error: Public key
+# signing has failed", about one key in a hundred), so keys that go into the prefix are
+# drawn again until every number has its full length.
+full_length_key() { # KEYFILE
+  openssl rsa -in "$1" -text -noout 2>/dev/null | awk '
+    /^[a-zA-Z0-9]+:/ { name = $1; sub(":", "", name); next }
+    /^ / { gsub(/[ \t]/, ""); n[name] = n[name] $0 }
+    END {
+      split("privateExponent:256 prime1:128 prime2:128 exponent1:128 exponent2:128 coefficient:128", want, " ")
+      for (i in want) {
+        split(want[i], kv, ":"); hex = n[kv[1]]; gsub(":", "", hex); sub(/^00/, "", hex)
+        if (length(hex) / 2 < kv[2]) exit 1
+      }
+    }'
+}
+
 leaf() { # NAME ISSUER SUBJECT EXTENSIONS...
   local name=$1 issuer=$2 subject=$3
   shift 3
   printf '%s\n' "$@" > "$name.ext"
-  openssl req -new -newkey rsa:2048 -nodes -keyout "$name.key" -out "$name.csr" \
-    -subj "/CN=$subject" 2>/dev/null
+  openssl genrsa -out "$name.key" 2048 2>/dev/null
+  while ! full_length_key "$name.key"; do
+    openssl genrsa -out "$name.key" 2048 2>/dev/null
+  done
+  openssl req -new -key "$name.key" -out "$name.csr" -subj "/CN=$subject" 2>/dev/null
   openssl x509 -req -in "$name.csr" -CA "$issuer.pem" -CAkey "$issuer.key" \
     -CAcreateserial -out "$name.pem" -days 30 -extfile "$name.ext" 2>/dev/null
   rm -f "$name.csr" "$name.ext"
