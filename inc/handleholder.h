@@ -133,6 +133,19 @@ struct HandleTraitsCertContext
     static BOOL Close(Type h) { return CertFreeCertificateContext(h); }
 };
 
+// Close only after the wait was cancelled and its callbacks waited for (or from inside the
+// callback itself, which frees the wait once the callback ends).
+struct HandleTraitsThreadpoolWait
+{
+    typedef PTP_WAIT Type;
+    static Type Invalid() { return nullptr; }
+    static BOOL Close(Type h)
+    {
+        CloseThreadpoolWait(h);
+        return TRUE;
+    }
+};
+
 typedef CHandleHolder<HandleTraitsKernel> CKernelHandle;
 typedef CHandleHolder<HandleTraitsFile> CFileHandle;
 typedef CHandleHolder<HandleTraitsFind> CFindHandle;
@@ -140,3 +153,4 @@ typedef CHandleHolder<HandleTraitsRegKey> CRegKeyHandle;
 typedef CHandleHolder<HandleTraitsModule> CModuleHandle;
 typedef CHandleHolder<HandleTraitsCertStore> CCertStoreHandle;
 typedef CHandleHolder<HandleTraitsCertContext> CCertContextHandle;
+typedef CHandleHolder<HandleTraitsThreadpoolWait> CThreadpoolWaitHandle;
