@@ -277,7 +277,7 @@ void CCollectorThread::Run()
         {
             GUID activityId;
             GUID logId;
-            HRESULT hr = client.WaitForRequest(&activityId, &logId, 50);
+            HRESULT hr = client.WaitForRequest(&activityId, &logId, 250);
             if (hr == HRESULT_FROM_WIN32(ERROR_TIMEOUT))
             {
                 continue;
