@@ -348,6 +348,9 @@ int main()
     setvbuf(stdout, nullptr, _IONBF, 0);
     SavedDword crowd = SaveAndSet(c_wszCrowdKey, L"EnableWifiCrowdsourcing", 3);
     SavedDword test = SaveAndSet(c_wszTestKey, L"EnableTestLogging", 1);
+    // The service makes only the last folder of the log directory.
+    CreateDirectoryW(L"C:\\Data", nullptr);
+    CreateDirectoryW(L"C:\\Data\\Test", nullptr);
     std::vector<GUID> rgLogIds;
 
     printf("Events of %lu bytes, one message each, into delivered traces:\n",

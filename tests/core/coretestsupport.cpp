@@ -160,6 +160,9 @@ bool CTraceSession::WaitFor(const std::string &text, size_t c, DWORD dwTimeoutMs
 
 void EnableFileDelivery()
 {
+    // The service makes only the last folder of the log directory.
+    CreateDirectoryW(L"C:\\Data", nullptr);
+    CreateDirectoryW(L"C:\\Data\\Test", nullptr);
     RegHelperSetDword(c_wszCrowdsourcingKey, L"EnableWifiCrowdsourcing", 3);
     RegHelperSetDword(c_wszTelvaneParametersKey, L"EnableTestLogging", 1);
 }
