@@ -37,10 +37,17 @@ constexpr uint32_t TELVANE_PROTOCOL_VERSION = 1;
 // in parts.
 constexpr uint32_t TELVANE_MAX_MESSAGE = 1200;
 
+// What clients can make the service hold, all in one place.
 // Largest event or result the service joins from its parts. Without a limit one client could
 // stream parts until the service runs out of memory; a part that would go past it closes that
 // client's pipe.
-constexpr uint32_t TELVANE_MAX_ITEM = 16 * 1024 * 1024;
+constexpr uint32_t TELVANE_MAX_ITEM = 4 * 1024 * 1024;
+// Unfinished items of all connections together: many clients each just under the item limit
+// would still exhaust the service. A part that would go past it closes its client's pipe.
+constexpr uint64_t TELVANE_MAX_PENDING_ITEMS = 64ull * 1024 * 1024;
+// Recorded values an open log may hold before it is flushed early (while its activity runs),
+// so a long or chatty activity is delivered in several logs instead of pinning memory.
+constexpr uint64_t TELVANE_MAX_LOG_BYTES = 4ull * 1024 * 1024;
 
 // Common header of every message. Stop and break-pipe messages are just this; bytes after it
 // are ignored.

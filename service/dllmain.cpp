@@ -3,6 +3,9 @@
 #include "service/telvaneservice.h"
 #include "servicelib/eventtrace.h"
 
+// The one coordinator of the DLL.
+TelvaneService g_TelvaneService;
+
 BOOL WINAPI DllMain(HINSTANCE hInstance, DWORD dwReason, LPVOID pvReserved)
 {
     switch (dwReason)

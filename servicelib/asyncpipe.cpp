@@ -126,6 +126,7 @@ void AsyncPipeFatalCode(const wchar_t *wszFunction, const wchar_t *wszFile, ULON
 AsyncPipe::AsyncPipe()
     : m_cRef(1)
     , m_hPipe(INVALID_HANDLE_VALUE)
+    , m_hPipeCreated(INVALID_HANDLE_VALUE)
     , m_pDataSink(nullptr)
     , m_pConnectSink(nullptr)
     , m_hregReadComplete(nullptr)
@@ -164,6 +165,10 @@ AsyncPipe::~AsyncPipe()
         FATAL_ERROR(L"AsyncPipe::~AsyncPipe", L"CloseHandle", GetLastError());
     }
     m_hPipe = INVALID_HANDLE_VALUE;
+    if (m_hPipeCreated != INVALID_HANDLE_VALUE && !CloseHandle(m_hPipeCreated))
+    {
+        FATAL_ERROR(L"AsyncPipe::~AsyncPipe", L"CloseHandle", GetLastError());
+    }
     DebugLog(L"AsyncPipe::~AsyncPipe", L"Destructed %p\r\n", this);
 }
 
@@ -185,6 +190,13 @@ ULONG AsyncPipe::Release()
 void AsyncPipe::Listen(const wchar_t *wszPipeName, IPipeDataSink *pDataSink,
                        IPipeConnectSink *pConnectSink)
 {
+    Create(wszPipeName, false);
+    Listen(pDataSink, pConnectSink);
+}
+
+DWORD AsyncPipe::Create(const wchar_t *wszPipeName, bool fFirstInstance)
+{
+    ASSERT_CHECK(L"AsyncPipe::Create", m_hPipeCreated == INVALID_HANDLE_VALUE);
     HANDLE hPipe;
     {
         CTransientSecurityDescriptor securityDescriptor;
@@ -198,17 +210,34 @@ void AsyncPipe::Listen(const wchar_t *wszPipeName, IPipeDataSink *pDataSink,
         // open after the service has closed it.
         SECURITY_ATTRIBUTES securityAttributes = {sizeof(securityAttributes),
                                                   securityDescriptor.Get(), FALSE};
-        hPipe = CreateNamedPipeW(wszPipeName, c_dwPipeOpenMode, c_dwPipeMode,
-                                 PIPE_UNLIMITED_INSTANCES, c_cbPipeOutBuffer, c_cbPipeInBuffer,
-                                 NMPWAIT_WAIT_FOREVER, &securityAttributes);
+        hPipe = CreateNamedPipeW(
+            wszPipeName, c_dwPipeOpenMode | (fFirstInstance ? FILE_FLAG_FIRST_PIPE_INSTANCE : 0),
+            c_dwPipeMode, PIPE_UNLIMITED_INSTANCES, c_cbPipeOutBuffer, c_cbPipeInBuffer,
+            NMPWAIT_WAIT_FOREVER, &securityAttributes);
     }
     DWORD dwError = GetLastError();
     DebugLog(L"AsyncPipe::Listen", L"hPipe=%x\r\n", static_cast<ULONG>(HandleToULong(hPipe)));
     if (hPipe == INVALID_HANDLE_VALUE)
     {
+        if (fFirstInstance)
+        {
+            return dwError;
+        }
         FATAL_ERROR(L"AsyncPipe::Listen", L"CreateNamedPipe", dwError);
+        return dwError;
+    }
+    m_hPipeCreated = hPipe;
+    return ERROR_SUCCESS;
+}
+
+void AsyncPipe::Listen(IPipeDataSink *pDataSink, IPipeConnectSink *pConnectSink)
+{
+    HANDLE hPipe = m_hPipeCreated;
+    if (hPipe == INVALID_HANDLE_VALUE)
+    {
         return;
     }
+    m_hPipeCreated = INVALID_HANDLE_VALUE;
     pDataSink->AddRef();
     if (pConnectSink != nullptr)
     {
@@ -372,6 +401,8 @@ void AsyncPipe::ConnectCompletedCallback()
             AsyncPipeFatalCode(L"AsyncPipe::ConnectCompletedCallback", TELVANE_WFILE, __LINE__,
                                L"ConnectNamedPipe", m_dwReadError);
         }
+        DebugLog(L"AsyncPipe::ConnectCompletedCallback", L"connect ended with %u\r\n",
+                 m_dwReadError);
         ReleaseConnectSink();
         BreakDataSink();
         break;

@@ -49,6 +49,12 @@ public:
     // Creates the pipe instance and waits for one client (caller's thread).
     void Listen(const wchar_t *wszPipeName, IPipeDataSink *pDataSink,
                 IPipeConnectSink *pConnectSink);
+    // The same in two steps (caller's thread). Create makes the instance; with fFirstInstance
+    // it must be the name's first one, and its refusal is returned (ERROR_ACCESS_DENIED on
+    // Windows when anyone holds the name) where every other failure is fatal. Listen then
+    // waits for one client on it. An instance never listened on is closed by the destructor.
+    DWORD Create(const wchar_t *wszPipeName, bool fFirstInstance);
+    void Listen(IPipeDataSink *pDataSink, IPipeConnectSink *pConnectSink);
     // Queues a copy of the bytes; they leave after everything written before them. Owners
     // write only once Connected arrived. Any thread.
     void Write(const BYTE *pb, ULONG cb);
@@ -100,6 +106,7 @@ private:
 
     volatile LONG m_cRef;
     HANDLE m_hPipe;
+    HANDLE m_hPipeCreated; // made by Create, handed to the handlers by Listen
     IPipeDataSink *m_pDataSink;
     IPipeConnectSink *m_pConnectSink;
     std::deque<std::unique_ptr<ByteVector>> m_queueWrite;

@@ -2,9 +2,39 @@
 
 #include <algorithm>
 
-CPipeReassembly::CPipeReassembly(size_t cbMax)
-    : m_cbMax(cbMax)
+bool CPipeReassemblyBudget::Reserve(uint64_t cb)
 {
+    uint64_t cbUsed = m_cbUsed.load();
+    do
+    {
+        if (cb > m_cbMax - cbUsed)
+        {
+            return false;
+        }
+    } while (!m_cbUsed.compare_exchange_weak(cbUsed, cbUsed + cb));
+    return true;
+}
+
+void CPipeReassemblyBudget::Return(uint64_t cb)
+{
+    m_cbUsed.fetch_sub(cb);
+}
+
+CPipeReassemblyBudget &PipeReassemblyServiceBudget()
+{
+    static CPipeReassemblyBudget s_budget(TELVANE_MAX_PENDING_ITEMS);
+    return s_budget;
+}
+
+CPipeReassembly::CPipeReassembly(size_t cbMax, CPipeReassemblyBudget *pBudget)
+    : m_cbMax(cbMax)
+    , m_pBudget(pBudget)
+{
+}
+
+CPipeReassembly::~CPipeReassembly()
+{
+    ReturnBudget();
 }
 
 PIPE_PART_RESULT CPipeReassembly::AddPart(const uint8_t *pb, size_t cb, bool fComplete)
@@ -19,6 +49,11 @@ PIPE_PART_RESULT CPipeReassembly::AddPart(const uint8_t *pb, size_t cb, bool fCo
     }
     if (cb != 0)
     {
+        if (m_pBudget != nullptr && !m_pBudget->Reserve(cb))
+        {
+            Clear();
+            return PipePartOverBudget;
+        }
         // Grow geometrically, but never past the cap: a large item must not cost twice the cap.
         size_t cbNeeded = cbHeld + cb;
         if (cbNeeded > m_vbBuffer.capacity())
@@ -32,6 +67,7 @@ PIPE_PART_RESULT CPipeReassembly::AddPart(const uint8_t *pb, size_t cb, bool fCo
 
 std::vector<uint8_t> CPipeReassembly::Take()
 {
+    ReturnBudget();
     std::vector<uint8_t> vb;
     vb.swap(m_vbBuffer);
     return vb;
@@ -39,6 +75,15 @@ std::vector<uint8_t> CPipeReassembly::Take()
 
 void CPipeReassembly::Clear()
 {
+    ReturnBudget();
     // Frees the storage too: an idle connection should not keep a large item's memory.
     std::vector<uint8_t>().swap(m_vbBuffer);
+}
+
+void CPipeReassembly::ReturnBudget()
+{
+    if (m_pBudget != nullptr && !m_vbBuffer.empty())
+    {
+        m_pBudget->Return(m_vbBuffer.size());
+    }
 }

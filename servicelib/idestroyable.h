@@ -14,6 +14,17 @@ public:
     virtual ULONG AddRef(ULONG ulTag) = 0;
     virtual ULONG Release(ULONG ulTag) = 0;
 
+    // WaitForDestroyComplete in two halves, so that an owner of many objects can wait for all
+    // of them before it gives any the settling pause that some need: the first blocks until the
+    // object's destroy event and says whether the object wants that pause (the owner then
+    // pauses once for all), the second does the rest. The defaults suit an object without one.
+    virtual bool WaitForDestroyEvent()
+    {
+        WaitForDestroyComplete();
+        return false;
+    }
+    virtual void FinishDestroy() {}
+
 protected:
     ~IDestroyable() = default;
 };

@@ -84,6 +84,15 @@ inline constexpr char c_szPipeFaultActivityOpcode[] =
 // An event whose parts add up to more than the reassembly cap.
 inline constexpr char c_szPipeFaultActivityEventTooLarge[] =
     "***CServiceActivity - event too large, closing pipe";
+// A part that would take the unfinished items of all connections past their budget.
+inline constexpr char c_szPipeFaultActivityOverBudget[] =
+    "***CServiceActivity - too much unfinished data across connections, closing pipe";
+// A version reply or a start that the connection's state does not expect (a second one).
+inline constexpr char c_szPipeFaultActivityState[] =
+    "***CServiceActivity - message out of order, closing pipe";
+// Events that arrived before the operation was attached, past the per-log bound.
+inline constexpr char c_szPipeFaultActivityBacklog[] =
+    "***CServiceActivity - too many events before the operation, closing pipe";
 
 inline constexpr char c_szPipeTraceCollectorVersion[] =
     "CServiceCollector::IncomingMessage() - TELVANE_VERSION_NEGOTIATE_OPCODE";
@@ -107,3 +116,8 @@ inline constexpr char c_szPipeFaultCollectorOpcode[] =
 // A result whose parts add up to more than the reassembly cap.
 inline constexpr char c_szPipeFaultCollectorResultTooLarge[] =
     "***CServiceCollector - result too large, closing pipe";
+inline constexpr char c_szPipeFaultCollectorOverBudget[] =
+    "***CServiceCollector - too much unfinished data across connections, closing pipe";
+// A version reply the connection does not expect, or a second register message.
+inline constexpr char c_szPipeFaultCollectorState[] =
+    "***CServiceCollector - message out of order, closing pipe";

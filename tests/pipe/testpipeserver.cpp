@@ -115,6 +115,8 @@ void CTestPipeServer::OnMessage(const BYTE *pb, ULONG cb)
             Fault(m_fCollector ? c_szPipeFaultCollectorResultTooLarge
                                : c_szPipeFaultActivityEventTooLarge);
             break;
+        case PipePartOverBudget: // this server has no budget
+            break;
         }
         break;
     default:

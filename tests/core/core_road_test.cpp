@@ -1,0 +1,102 @@
+// One activity and its collectors from start to delivered trace, through real pipes into the
+// files the service writes, read back member by member.
+#include "tests/core/coretestsupport.h"
+
+#include <algorithm>
+
+using namespace coretest;
+
+namespace
+{
+class CoreRoad : public CCoreTest
+{
+};
+
+// JSON text of about cb bytes, so that it travels in several parts.
+std::string LongJson(size_t cb, char ch)
+{
+    return "\"" + std::string(cb, ch) + "\"";
+}
+} // namespace
+
+TEST_F(CoreRoad, OneActivityWithOneCollectorIsDeliveredWhole)
+{
+    GUID collectorId = NewGuid();
+    std::string strResult = "{\"collected\":" + LongJson(3000, 'c') + "}";
+    CCollectorThread collector(m_wstrCollectorPipe, collectorId, strResult);
+    ASSERT_TRUE(collector.WaitRegistered());
+
+    GUID activityId = NewGuid();
+    GUID logId = NewGuid();
+    GUID eventA = NewGuid();
+    GUID eventB = NewGuid();
+    std::string strLong = LongJson(2500, 'e'); // three parts
+    RunActivity(activityId, logId,
+                {{eventA, "{\"n\":1}"}, {eventB, strLong}, {eventA, "[2,3]"}, {eventA, "4"}});
+
+    std::vector<DeliveredLog> rgLogs = WaitForLogs(logId, 1);
+    ASSERT_EQ(1u, rgLogs.size());
+    const rapidjson::Value &log = *rgLogs[0].doc;
+
+    // The members in their order: the header, the end time, the two event groups and the
+    // collector's group in any order, then the end mark.
+    std::vector<std::string> rgNames;
+    for (const auto &member : log.GetObject())
+    {
+        rgNames.push_back(member.name.GetString());
+    }
+    ASSERT_EQ(14u, rgNames.size());
+    EXPECT_EQ(
+        (std::vector<std::string>{"ActivityID", "SessionID", "JsonVersion", "LogID", "WiFiConnID",
+                                  "LogCount", "TimeStamp", "Orvex", "Phone", "ExecutionTime"}),
+        std::vector<std::string>(rgNames.begin(), rgNames.begin() + 10));
+    std::vector<std::string> rgGroups(rgNames.begin() + 10, rgNames.begin() + 13);
+    std::sort(rgGroups.begin(), rgGroups.end());
+    std::vector<std::string> rgExpectedGroups = {"ID" + GuidText(eventA), "ID" + GuidText(eventB),
+                                                 "ID" + GuidText(collectorId)};
+    std::sort(rgExpectedGroups.begin(), rgExpectedGroups.end());
+    EXPECT_EQ(rgExpectedGroups, rgGroups);
+    EXPECT_EQ("LogEnd", rgNames.back());
+    EXPECT_EQ(36u, std::string(log["SessionID"].GetString()).size());
+    EXPECT_EQ(24u, log["JsonVersion"].GetUint());
+    EXPECT_TRUE(log["TimeStamp"].IsUint64());
+    EXPECT_TRUE(log["ExecutionTime"].IsUint64());
+    EXPECT_GE(log["ExecutionTime"].GetUint64(), log["TimeStamp"].GetUint64());
+    EXPECT_TRUE(log["Orvex"].IsObject());
+    EXPECT_TRUE(log["Phone"].IsObject());
+
+    EXPECT_EQ(GuidText(activityId), log["ActivityID"].GetString());
+    EXPECT_EQ(GuidText(logId), log["LogID"].GetString());
+    EXPECT_EQ(1u, log["LogCount"].GetUint());
+    EXPECT_TRUE(log.HasMember("ExecutionTime"));
+    ASSERT_TRUE(log.HasMember("LogEnd"));
+    EXPECT_TRUE(log["LogEnd"].GetBool());
+    EXPECT_EQ((std::vector<std::string>{"{\"n\":1}", "[2,3]", "4"}), GroupValues(log, eventA));
+    EXPECT_EQ((std::vector<std::string>{strLong}), GroupValues(log, eventB));
+    EXPECT_EQ((std::vector<std::string>{strResult}), GroupValues(log, collectorId));
+
+    // The collector was asked once, for this run.
+    std::vector<GUID> rgAsked = collector.RequestLogIds();
+    ASSERT_EQ(1u, rgAsked.size());
+    EXPECT_EQ(GuidText(logId), GuidText(rgAsked[0]));
+}
+
+TEST_F(CoreRoad, ActivityWithoutCollectorsCompletesAtItsEnd)
+{
+    GUID logId = NewGuid();
+    GUID eventId = NewGuid();
+    RunActivity(NewGuid(), logId, {{eventId, "true"}});
+    std::vector<DeliveredLog> rgLogs = WaitForLogs(logId, 1);
+    ASSERT_EQ(1u, rgLogs.size());
+    EXPECT_TRUE((*rgLogs[0].doc)["LogEnd"].GetBool());
+    EXPECT_EQ((std::vector<std::string>{"true"}), GroupValues(*rgLogs[0].doc, eventId));
+}
+
+TEST_F(CoreRoad, ActivityThatRecordedNothingDeliversNothing)
+{
+    GUID logId = NewGuid();
+    RunActivity(NewGuid(), logId, {});
+    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::FlushLog() - nothing to flush"));
+    Stop();
+    EXPECT_TRUE(LogsOf(logId).empty());
+}
