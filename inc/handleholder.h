@@ -6,6 +6,7 @@
 
 #include <windows.h>
 #include <wincrypt.h>
+#include <winhttp.h>
 
 template <class Traits>
 class CHandleHolder
@@ -133,6 +134,13 @@ struct HandleTraitsCertContext
     static BOOL Close(Type h) { return CertFreeCertificateContext(h); }
 };
 
+struct HandleTraitsWinHttp // sessions, connections and requests of the platform HTTP client
+{
+    typedef HINTERNET Type;
+    static Type Invalid() { return nullptr; }
+    static BOOL Close(Type h) { return WinHttpCloseHandle(h); }
+};
+
 typedef CHandleHolder<HandleTraitsKernel> CKernelHandle;
 typedef CHandleHolder<HandleTraitsFile> CFileHandle;
 typedef CHandleHolder<HandleTraitsFind> CFindHandle;
@@ -140,3 +148,4 @@ typedef CHandleHolder<HandleTraitsRegKey> CRegKeyHandle;
 typedef CHandleHolder<HandleTraitsModule> CModuleHandle;
 typedef CHandleHolder<HandleTraitsCertStore> CCertStoreHandle;
 typedef CHandleHolder<HandleTraitsCertContext> CCertContextHandle;
+typedef CHandleHolder<HandleTraitsWinHttp> CWinHttpHandle;

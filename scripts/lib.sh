@@ -70,6 +70,18 @@ telvane_wine_start() {
   fi
 }
 
+# What the phone has and a fresh prefix lacks for the UDP echo test: the policy folder the
+# service keeps its policy in, and the test application at the path the service starts.
+telvane_install_udptest() {
+  local drive="$WINEPREFIX/drive_c"
+  if [ ! -f "$TELVANE_BUILD/bin/ZoRiVirOruz.exe" ]; then
+    telvane_log "build ZoRiVirOruz.exe first"
+    return 1
+  fi
+  mkdir -p "$drive/data/shareddata/zoriviroruz" "$drive/programs/zoriviroruz"
+  cp "$TELVANE_BUILD/bin/ZoRiVirOruz.exe" "$drive/programs/zoriviroruz/ZoRiVirOruz.exe"
+}
+
 telvane_wine_stop() {
   WINEPREFIX="$WINEPREFIX" wineserver -k </dev/null >/dev/null 2>&1 || true
 }

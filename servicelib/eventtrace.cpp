@@ -149,6 +149,17 @@ void TraceMark(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor)
     }
 }
 
+void TraceCode(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor, ULONG ulCode)
+{
+    EVENT_DATA_DESCRIPTOR data;
+    EventDataDescCreate(&data, &ulCode, sizeof(ulCode));
+    TraceWrite(hProvider, pDescriptor, 1, &data);
+    if (s_fEcho)
+    {
+        DebugLog(L"EventTrace", L"%u 0x%x\r\n", pDescriptor->Id, ulCode);
+    }
+}
+
 void TraceWideMessage(REGHANDLE hProvider, const wchar_t *wszText)
 {
     const wchar_t *wsz = wszText != nullptr ? wszText : c_wszNull;
@@ -161,7 +172,7 @@ void TraceWideMessage(REGHANDLE hProvider, const wchar_t *wszText)
     }
 }
 
-void TelvaneTraceRegister()
+void TraceReadEchoSetting()
 {
     // An empty value is read as length 0 without touching the last error, so clear it first
     // or an error left by earlier code would hide the variable.
@@ -172,6 +183,11 @@ void TelvaneTraceRegister()
     {
         s_fEcho = true;
     }
+}
+
+void TelvaneTraceRegister()
+{
+    TraceReadEchoSetting();
     TraceProviderRegister(TELVANE_PROVIDER_GUID, &g_TelvaneTraceProvider);
 }
 

@@ -35,6 +35,7 @@ void TraceMessage(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor, cons
 void TraceFailure(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor, const char *szText,
                   ULONG ulCode);
 void TraceMark(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor);
+void TraceCode(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor, ULONG ulCode);
 void TraceWideMessage(REGHANDLE hProvider, const wchar_t *wszText);
 
 // The main provider, registered while the DLL is attached.
@@ -56,8 +57,10 @@ void TelvaneTraceMark(const EVENT_DESCRIPTOR &descriptor);     // 2005, 2006, 20
 void TelvaneTraceCommandLine(const wchar_t *wszCommandLine);   // 2008
 
 // Where the platform never enables a provider (Wine), setting TELVANE_TRACE_STDOUT before
-// registration enables every bit and echoes each event as a debug line. Tests capture the
-// written events through a hook that replaces EventWrite.
+// registration enables every bit and echoes each event as a debug line. Every provider of
+// the process reads the variable through TraceReadEchoSetting before it registers. Tests capture
+// the written events through a hook that replaces EventWrite.
 typedef void (*PFN_TRACE_WRITE)(REGHANDLE hProvider, const EVENT_DESCRIPTOR *pDescriptor,
                                 ULONG cData, const EVENT_DATA_DESCRIPTOR *pData);
 void TraceSetWriteHook(PFN_TRACE_WRITE pfnHook);
+void TraceReadEchoSetting();
