@@ -141,6 +141,19 @@ struct HandleTraitsWinHttp // sessions, connections and requests of the platform
     static BOOL Close(Type h) { return WinHttpCloseHandle(h); }
 };
 
+// Close only after the wait was cancelled and its callbacks waited for (or from inside the
+// callback itself, which frees the wait once the callback ends).
+struct HandleTraitsThreadpoolWait
+{
+    typedef PTP_WAIT Type;
+    static Type Invalid() { return nullptr; }
+    static BOOL Close(Type h)
+    {
+        CloseThreadpoolWait(h);
+        return TRUE;
+    }
+};
+
 typedef CHandleHolder<HandleTraitsKernel> CKernelHandle;
 typedef CHandleHolder<HandleTraitsFile> CFileHandle;
 typedef CHandleHolder<HandleTraitsFind> CFindHandle;
@@ -149,3 +162,4 @@ typedef CHandleHolder<HandleTraitsModule> CModuleHandle;
 typedef CHandleHolder<HandleTraitsCertStore> CCertStoreHandle;
 typedef CHandleHolder<HandleTraitsCertContext> CCertContextHandle;
 typedef CHandleHolder<HandleTraitsWinHttp> CWinHttpHandle;
+typedef CHandleHolder<HandleTraitsThreadpoolWait> CThreadpoolWaitHandle;

@@ -11,6 +11,7 @@ const size_t c_cchMax = 0x7FFFFFFF;
 const HRESULT c_hrInsufficientBuffer = 0x8007007A;
 
 PFN_DIAGNOSTICS_LINE volatile s_pfnLogHook = nullptr;
+volatile LONG s_fLogQuiet = FALSE;
 PFN_DIAGNOSTICS_LINE volatile s_pfnFailureHook = nullptr;
 
 // Standard output gets the low byte of every character, written straight to the handle so
@@ -91,7 +92,11 @@ HRESULT StringCchPrintf(char *szDest, size_t cchDest, const char *szFormat, ...)
     return hr;
 }
 
-void DebugLog(const wchar_t *wszFunction, const wchar_t *wszFormat, ...)
+namespace
+{
+// Failure reports are written whatever the quiet setting: a benchmark that dies must say why.
+void DiagnosticsVLog(bool fFailure, const wchar_t *wszFunction, const wchar_t *wszFormat,
+                     va_list args)
 {
     SYSTEMTIME st;
     GetLocalTime(&st);
@@ -99,13 +104,13 @@ void DebugLog(const wchar_t *wszFunction, const wchar_t *wszFormat, ...)
     StringCchPrintf(wszLine, c_cchLine, L"[%02d:%02d:%02d] %s: ", st.wHour, st.wMinute, st.wSecond,
                     wszFunction != nullptr ? wszFunction : L"(null)");
     size_t cchPrefix = wcslen(wszLine);
-    va_list args;
-    va_start(args, wszFormat);
     StringCchVPrintf(wszLine + cchPrefix, c_cchLine - cchPrefix, wszFormat, args);
-    va_end(args);
 
-    OutputDebugStringW(wszLine);
-    DiagnosticsWriteStdout(wszLine);
+    if (fFailure || !InterlockedCompareExchange(&s_fLogQuiet, FALSE, FALSE))
+    {
+        OutputDebugStringW(wszLine);
+        DiagnosticsWriteStdout(wszLine);
+    }
     PFN_DIAGNOSTICS_LINE pfnHook = s_pfnLogHook;
     if (pfnHook != nullptr)
     {
@@ -113,10 +118,28 @@ void DebugLog(const wchar_t *wszFunction, const wchar_t *wszFormat, ...)
     }
 }
 
+void DiagnosticsFailureLog(const wchar_t *wszFunction, const wchar_t *wszFormat, ...)
+{
+    va_list args;
+    va_start(args, wszFormat);
+    DiagnosticsVLog(true, wszFunction, wszFormat, args);
+    va_end(args);
+}
+} // namespace
+
+void DebugLog(const wchar_t *wszFunction, const wchar_t *wszFormat, ...)
+{
+    va_list args;
+    va_start(args, wszFormat);
+    DiagnosticsVLog(false, wszFunction, wszFormat, args);
+    va_end(args);
+}
+
 bool Assert(const wchar_t *wszFunction, const wchar_t *wszFile, ULONG ulLine,
             const wchar_t *wszExpression)
 {
-    DebugLog(wszFunction, L"%s(%d): Assertion failure: %s\r\n", wszFile, ulLine, wszExpression);
+    DiagnosticsFailureLog(wszFunction, L"%s(%d): Assertion failure: %s\r\n", wszFile, ulLine,
+                          wszExpression);
     PFN_DIAGNOSTICS_LINE pfnHook = s_pfnFailureHook;
     if (pfnHook != nullptr)
     {
@@ -143,8 +166,8 @@ void FatalError(const wchar_t *wszFunction, const wchar_t *wszFile, ULONG ulLine
     {
         StringCchPrintf(wszMessage, c_cchLine, L"%s", L"(unknown error code)");
     }
-    DebugLog(wszFunction, L"%s(%d): Fatal error 0x%x from %s: %s\r\n", wszFile, ulLine, ulCode,
-             wszCall, wszMessage);
+    DiagnosticsFailureLog(wszFunction, L"%s(%d): Fatal error 0x%x from %s: %s\r\n", wszFile, ulLine,
+                          ulCode, wszCall, wszMessage);
     PFN_DIAGNOSTICS_LINE pfnHook = s_pfnFailureHook;
     if (pfnHook != nullptr)
     {
@@ -170,6 +193,11 @@ void DiagnosticsSetLogHook(PFN_DIAGNOSTICS_LINE pfnHook)
 void DiagnosticsSetFailureHook(PFN_DIAGNOSTICS_LINE pfnHook)
 {
     s_pfnFailureHook = pfnHook;
+}
+
+void DiagnosticsSetLogQuiet(bool fQuiet)
+{
+    InterlockedExchange(&s_fLogQuiet, fQuiet ? TRUE : FALSE);
 }
 
 void TaggedRefFailure(const wchar_t *wszFunction, const wchar_t *wszFile, unsigned long ulLine,

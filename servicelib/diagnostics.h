@@ -51,3 +51,7 @@ void FatalError(const wchar_t *wszFunction, const wchar_t *wszFile, ULONG ulLine
 typedef void (*PFN_DIAGNOSTICS_LINE)(const wchar_t *wszLine);
 void DiagnosticsSetLogHook(PFN_DIAGNOSTICS_LINE pfnHook);
 void DiagnosticsSetFailureHook(PFN_DIAGNOSTICS_LINE pfnHook);
+
+// For processes whose output is their figures (the benchmarks): debug lines still reach the
+// log hook, but neither the debugger nor standard output. Failure reports always do.
+void DiagnosticsSetLogQuiet(bool fQuiet);

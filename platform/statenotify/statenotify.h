@@ -1,8 +1,9 @@
 // Stand-in for the phone's state-notification facility: named, machine-wide state values
 // (a 64-bit state name, a change stamp and up to 4 KiB of data) that any process may publish
-// and any process may query or subscribe to. Subscribers are called on a thread-pool thread,
-// once per change they have not seen, in change-stamp order, one call at a time per
-// subscription. Every function may be called from any thread.
+// and any process may query or subscribe to. A subscriber is called on a thread-pool thread
+// with the state's latest value whenever its change stamp passed the last one delivered
+// (changes in quick succession may arrive as one call, with the latest value), one call at a
+// time per subscription. Every function may be called from any thread.
 //
 // Publishing is not part of the facility's calls that the service makes; telvanectl and the
 // tests publish through platform/statenotify/statenotifypublish.h.

@@ -93,6 +93,39 @@ TEST(Assert, CheckReportsOnlyFalseConditions)
     EXPECT_TRUE(log.Contains(L"): Assertion failure: cValue == 2\r\n"));
 }
 
+TEST(DebugLog, QuietProcessPrintsFailureReportsButNoDebugLines)
+{
+    const std::wstring child = L"\"" + testsupport::BinDir() + L"foundation_child.exe\" quiet ";
+    struct Case
+    {
+        const wchar_t *wszMode;
+        DWORD dwExitCode;
+        const char *szOutputPart;
+    };
+    const Case rgCases[] = {
+        {L"figures", 0, "figure 42\n"},
+        {L"fatal", 0xC0000602u, "): Fatal error 0x5 from CreateThing: "},
+        {L"assert", 0xC0000602u, "Assertion failure: cItems == 3\r\n"},
+    };
+    for (const Case &c : rgCases)
+    {
+        testsupport::ChildResult result = testsupport::RunChild(child + c.wszMode);
+        EXPECT_EQ(c.dwExitCode, result.dwExitCode) << testsupport::Narrow(c.wszMode);
+        EXPECT_NE(std::string::npos, result.strOutput.find(c.szOutputPart)) << result.strOutput;
+        EXPECT_EQ(std::string::npos, result.strOutput.find("nobody sees")) << result.strOutput;
+    }
+    EXPECT_EQ("figure 42\n", testsupport::RunChild(child + L"figures").strOutput);
+}
+
+TEST(DebugLog, QuietLinesStillReachTheLogHook)
+{
+    LogCapture log;
+    DiagnosticsSetLogQuiet(true);
+    DebugLog(L"Tests::Quiet", L"%s\r\n", L"seen by the hook");
+    DiagnosticsSetLogQuiet(false);
+    EXPECT_TRUE(log.Contains(L"Tests::Quiet: seen by the hook\r\n"));
+}
+
 TEST(FailFast, FatalErrorAndAssertEndTheProcess)
 {
     const std::wstring child = L"\"" + testsupport::BinDir() + L"foundation_child.exe\"";

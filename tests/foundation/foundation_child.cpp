@@ -8,9 +8,25 @@
 
 int wmain(int argc, wchar_t **argv)
 {
+    if (argc >= 2 && wcscmp(argv[1], L"quiet") == 0)
+    {
+        // As a benchmark process runs: its debug lines must not reach the output.
+        DiagnosticsSetLogQuiet(true);
+        DebugLog(L"ChildMain", L"a debug line nobody sees\r\n");
+        argc--;
+        argv++;
+    }
     if (argc < 2)
     {
         return 2;
+    }
+    if (wcscmp(argv[1], L"figures") == 0)
+    {
+        const char szFigures[] = "figure 42\n";
+        DWORD cbWritten = 0;
+        WriteFile(GetStdHandle(STD_OUTPUT_HANDLE), szFigures, sizeof(szFigures) - 1, &cbWritten,
+                  nullptr);
+        return 0;
     }
     if (wcscmp(argv[1], L"fatal") == 0)
     {

@@ -1,0 +1,490 @@
+// The state-notification stand-in: machine-wide values published by one process and seen by
+// another, the subscription lifecycle (including its end from inside its own callback), and
+// the query's corner cases.
+#include "platform/statenotify/statenotify.h"
+#include "platform/statenotify/statenotifypublish.h"
+#include "tests/common/testsupport.h"
+#include "tests/platform/platformtestsupport.h"
+
+#include <gtest/gtest.h>
+
+#include <string.h>
+#include <thread>
+#include <vector>
+
+using platformtest::CDeliveryLog;
+using platformtest::Delivery;
+using platformtest::NewStateName;
+using platformtest::ValueOf;
+
+namespace
+{
+const NTSTATUS c_statusInvalidParameter = static_cast<NTSTATUS>(STATUS_INVALID_PARAMETER);
+const WNF_TYPE_ID c_typeId = {
+    {0x6d1f2a10, 0x3c4b, 0x4e5f, {0x80, 0x91, 0xa2, 0xb3, 0xc4, 0xd5, 0xe6, 0xf7}}};
+
+HRESULT PublishValue(WNF_STATE_NAME stateName, DWORD dwValue, WNF_CHANGE_STAMP *pStamp = nullptr)
+{
+    return StateNotifyPublish(stateName, &dwValue, sizeof(dwValue), pStamp);
+}
+
+// Publishes from a process of its own, as the phone's components do.
+void PublishFromChild(WNF_STATE_NAME stateName, DWORD dwValue, WNF_CHANGE_STAMP stampExpected)
+{
+    testsupport::ChildResult result = testsupport::RunChild(
+        platformtest::TelvanectlCommand() + L" platform state " +
+        platformtest::StateNameText(stateName) + L" " + std::to_wstring(dwValue));
+    ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
+    EXPECT_NE(std::string::npos,
+              result.strOutput.find("(change stamp " + std::to_string(stampExpected) + ")"))
+        << result.strOutput;
+}
+
+PWNF_USER_SUBSCRIPTION Subscribe(WNF_STATE_NAME stateName, WNF_CHANGE_STAMP stamp,
+                                 CDeliveryLog *pLog, PCWNF_TYPE_ID pTypeId = nullptr)
+{
+    PWNF_USER_SUBSCRIPTION pSubscription = nullptr;
+    NTSTATUS status = RtlSubscribeWnfStateChangeNotification(
+        &pSubscription, stateName, stamp, CDeliveryLog::Callback, pLog, pTypeId, 0, 0);
+    EXPECT_EQ(STATUS_SUCCESS, status);
+    EXPECT_NE(nullptr, pSubscription);
+    pLog->m_pSubscription = pSubscription;
+    return pSubscription;
+}
+
+// A subscription that has ended gets nothing more: a later subscription to the same state
+// sees the next two publications, and by then the ended one has seen nothing new.
+void ExpectNoMoreDeliveries(WNF_STATE_NAME stateName, const CDeliveryLog &ended)
+{
+    size_t cBefore = ended.Count();
+    CDeliveryLog later;
+    WNF_CHANGE_STAMP stamp = 0;
+    BYTE rgb[WNF_STATE_MAX_DATA_SIZE];
+    ULONG cb = sizeof(rgb);
+    ASSERT_EQ(STATUS_SUCCESS, NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, rgb, &cb));
+    PWNF_USER_SUBSCRIPTION pLater = Subscribe(stateName, stamp, &later);
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 40));
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 41));
+    ASSERT_TRUE(later.WaitForStamp(stamp + 2));
+    EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pLater));
+    EXPECT_EQ(cBefore, ended.Count());
+}
+} // namespace
+
+TEST(StateNotify, UnpublishedStateReadsAsNeverPublished)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    DWORD dwValue = 0xCCCCCCCC;
+    ULONG cb = sizeof(dwValue);
+    WNF_CHANGE_STAMP stamp = 99;
+    EXPECT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, &dwValue, &cb));
+    EXPECT_EQ(0u, stamp);
+    EXPECT_EQ(0u, cb);
+    EXPECT_EQ(0xCCCCCCCCu, dwValue);
+
+    // A subscriber creates the state's key to watch it; the state still reads unpublished.
+    CDeliveryLog log;
+    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
+    cb = 0;
+    stamp = 99;
+    EXPECT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, &c_typeId, nullptr, &stamp, nullptr, &cb));
+    EXPECT_EQ(0u, stamp);
+    EXPECT_EQ(0u, cb);
+    EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+    EXPECT_EQ(0u, log.Count());
+}
+
+TEST(StateNotify, RefusesMissingArguments)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    DWORD dwValue = 0;
+    ULONG cbFour = sizeof(dwValue);
+    WNF_CHANGE_STAMP stamp = 0;
+    struct QueryCase
+    {
+        const char *szWhat;
+        PCWNF_STATE_NAME pStateName;
+        PVOID pvBuffer;
+        PULONG pcb;
+    };
+    const QueryCase rgQueries[] = {
+        {"no state name", nullptr, &dwValue, &cbFour},
+        {"no size", &stateName, &dwValue, nullptr},
+        {"a size without a buffer", &stateName, nullptr, &cbFour},
+    };
+    for (const QueryCase &c : rgQueries)
+    {
+        EXPECT_EQ(c_statusInvalidParameter,
+                  NtQueryWnfStateData(c.pStateName, nullptr, nullptr, &stamp, c.pvBuffer, c.pcb))
+            << c.szWhat;
+    }
+
+    CDeliveryLog log;
+    PWNF_USER_SUBSCRIPTION pSubscription = nullptr;
+    struct SubscribeCase
+    {
+        const char *szWhat;
+        PWNF_USER_SUBSCRIPTION *ppSubscription;
+        PWNF_USER_CALLBACK pfnCallback;
+        ULONG ulFlags;
+    };
+    const SubscribeCase rgSubscribes[] = {
+        {"no place for the subscription", nullptr, CDeliveryLog::Callback, 0},
+        {"no callback", &pSubscription, nullptr, 0},
+        {"unknown flags", &pSubscription, CDeliveryLog::Callback, 1},
+    };
+    for (const SubscribeCase &c : rgSubscribes)
+    {
+        EXPECT_EQ(c_statusInvalidParameter,
+                  RtlSubscribeWnfStateChangeNotification(
+                      c.ppSubscription, stateName, 0, c.pfnCallback, &log, nullptr, 0, c.ulFlags))
+            << c.szWhat;
+        EXPECT_EQ(nullptr, pSubscription) << c.szWhat;
+    }
+    EXPECT_EQ(c_statusInvalidParameter, RtlUnsubscribeWnfNotificationWaitForCompletion(nullptr));
+}
+
+TEST(StateNotify, QueryReturnsTheLatestPublicationWithItsStamp)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    std::vector<BYTE> vbFull(WNF_STATE_MAX_DATA_SIZE);
+    for (size_t i = 0; i < vbFull.size(); i++)
+    {
+        vbFull[i] = static_cast<BYTE>(i * 7);
+    }
+    WNF_CHANGE_STAMP stamp = 0;
+    ASSERT_HRESULT_SUCCEEDED(StateNotifyPublish(stateName, nullptr, 0, &stamp));
+    EXPECT_EQ(1u, stamp);
+    ASSERT_HRESULT_SUCCEEDED(
+        StateNotifyPublish(stateName, vbFull.data(), static_cast<ULONG>(vbFull.size()), &stamp));
+    EXPECT_EQ(2u, stamp);
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_INVALID_PARAMETER),
+              StateNotifyPublish(stateName, vbFull.data(), WNF_STATE_MAX_DATA_SIZE + 1, nullptr));
+
+    std::vector<BYTE> vbRead(WNF_STATE_MAX_DATA_SIZE + 16, 0xEE);
+    ULONG cb = static_cast<ULONG>(vbRead.size());
+    stamp = 0;
+    ASSERT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, vbRead.data(), &cb));
+    EXPECT_EQ(2u, stamp);
+    ASSERT_EQ(WNF_STATE_MAX_DATA_SIZE, cb);
+    EXPECT_EQ(0, memcmp(vbFull.data(), vbRead.data(), cb));
+
+    // Too small a buffer gets nothing, and the size it would need.
+    std::vector<BYTE> vbSmall(16, 0xEE);
+    cb = static_cast<ULONG>(vbSmall.size());
+    EXPECT_EQ(STATUS_BUFFER_TOO_SMALL,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, vbSmall.data(), &cb));
+    EXPECT_EQ(WNF_STATE_MAX_DATA_SIZE, cb);
+    EXPECT_EQ(std::vector<BYTE>(16, 0xEE), vbSmall);
+
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 0));
+    DWORD dwValue = 0xFFFFFFFF;
+    cb = sizeof(dwValue);
+    ASSERT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, &dwValue, &cb));
+    EXPECT_EQ(3u, stamp);
+    EXPECT_EQ(sizeof(dwValue), cb);
+    EXPECT_EQ(0u, dwValue);
+}
+
+TEST(StateNotify, ConcurrentPublishersRaiseTheStampOncePerPublication)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    const int c_cThreads = 6;
+    const int c_cEach = 25;
+    std::vector<std::thread> threads;
+    std::vector<HRESULT> rghr(c_cThreads, S_OK);
+    for (int iThread = 0; iThread < c_cThreads; iThread++)
+    {
+        threads.emplace_back([&, iThread] {
+            for (int i = 0; i < c_cEach && SUCCEEDED(rghr[iThread]); i++)
+            {
+                rghr[iThread] = PublishValue(stateName, static_cast<DWORD>(iThread));
+            }
+        });
+    }
+    // And one more process at the same time, through its own handles of the same mutex.
+    {
+        testsupport::ChildResult result =
+            testsupport::RunChild(platformtest::TelvanectlCommand() + L" platform state " +
+                                  platformtest::StateNameText(stateName) + L" 77");
+        EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
+    }
+    for (std::thread &t : threads)
+    {
+        t.join();
+    }
+    for (HRESULT hr : rghr)
+    {
+        EXPECT_HRESULT_SUCCEEDED(hr);
+    }
+    WNF_CHANGE_STAMP stamp = 0;
+    ULONG cb = 0;
+    EXPECT_EQ(STATUS_BUFFER_TOO_SMALL,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, nullptr, &cb));
+    EXPECT_EQ(static_cast<WNF_CHANGE_STAMP>(c_cThreads * c_cEach + 1), stamp);
+}
+
+TEST(StateNotify, SubscriberSeesEachPublicationOfAnotherProcess)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    CDeliveryLog log;
+    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log, &c_typeId);
+    const DWORD rgdwValues[] = {5, 0, 7};
+    for (DWORD i = 0; i < ARRAYSIZE(rgdwValues); i++)
+    {
+        PublishFromChild(stateName, rgdwValues[i], i + 1);
+        // Each publication is awaited before the next, so none is folded into another.
+        ASSERT_TRUE(log.WaitForCount(i + 1)) << "publication " << i + 1;
+    }
+    EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+
+    std::vector<Delivery> rg = log.Deliveries();
+    ASSERT_EQ(ARRAYSIZE(rgdwValues), rg.size());
+    for (size_t i = 0; i < rg.size(); i++)
+    {
+        EXPECT_EQ(stateName, rg[i].stateName);
+        EXPECT_EQ(i + 1, rg[i].stamp);
+        EXPECT_EQ(rgdwValues[i], ValueOf(rg[i].vbData));
+        EXPECT_TRUE(rg[i].fHadTypeId);
+        EXPECT_TRUE(IsEqualGUID(c_typeId.TypeId, rg[i].typeId));
+        // On a thread of the pool, never the subscriber's own.
+        EXPECT_NE(GetCurrentThreadId(), rg[i].dwThreadId);
+    }
+}
+
+TEST(StateNotify, SubscriptionStartsAfterTheStampItIsGiven)
+{
+    struct Case
+    {
+        WNF_CHANGE_STAMP stampGiven;
+        std::vector<WNF_CHANGE_STAMP> rgStampsExpected; // after publications 1, 2, subscribe, 3
+    };
+    const Case rgCases[] = {
+        {0, {2, 3}}, // the current value at once, then the change
+        {1, {2, 3}},
+        {2, {3}}, // the subscriber has seen the current value
+    };
+    for (const Case &c : rgCases)
+    {
+        WNF_STATE_NAME stateName = NewStateName();
+        ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+        ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 2));
+        CDeliveryLog log;
+        PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, c.stampGiven, &log);
+        if (c.rgStampsExpected.size() > 1)
+        {
+            // The first delivery is the current value, before anything else is published:
+            // a publication racing it could fold both into one call.
+            ASSERT_TRUE(log.WaitForCount(1)) << "given " << c.stampGiven;
+        }
+        ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 3));
+        ASSERT_TRUE(log.WaitForStamp(3)) << "given " << c.stampGiven;
+        EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+        std::vector<WNF_CHANGE_STAMP> rgStamps;
+        for (const Delivery &d : log.Deliveries())
+        {
+            rgStamps.push_back(d.stamp);
+            EXPECT_EQ(d.stamp, ValueOf(d.vbData));
+        }
+        EXPECT_EQ(c.rgStampsExpected, rgStamps) << "given " << c.stampGiven;
+    }
+}
+
+TEST(StateNotify, UnsubscribeInsideItsOwnCallbackDoesNotWaitForItself)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    CDeliveryLog log;
+    // What the service's launcher does when its destroy request is handled on the thread
+    // that posted the notification.
+    log.m_pfnDuring = [](CDeliveryLog *pLog) {
+        pLog->m_statusInCallback =
+            RtlUnsubscribeWnfNotificationWaitForCompletion(pLog->m_pSubscription);
+    };
+    log.m_statusInCallback = -1;
+    Subscribe(stateName, 0, &log);
+    PublishFromChild(stateName, 3, 1);
+    // A subscription waiting for itself would never come back to tell.
+    ASSERT_TRUE(log.WaitForCount(1));
+    EXPECT_EQ(STATUS_SUCCESS, log.m_statusInCallback);
+    ExpectNoMoreDeliveries(stateName, log);
+    EXPECT_EQ(1u, log.Count());
+}
+
+TEST(StateNotify, UnsubscribeWhileIdleEndsDeliveries)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    CDeliveryLog log;
+    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
+    PublishFromChild(stateName, 8, 1);
+    ASSERT_TRUE(log.WaitForCount(1));
+    EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+    ExpectNoMoreDeliveries(stateName, log);
+    EXPECT_EQ(1u, log.Count());
+}
+
+TEST(StateNotify, UnsubscribeFromAnotherThreadWaitsForTheRunningCallback)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    static HANDLE s_hEntered = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    static HANDLE s_hRelease = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    static volatile LONG s_fCallbackDone = 0;
+    CDeliveryLog log;
+    log.m_pfnDuring = [](CDeliveryLog *) {
+        SetEvent(s_hEntered);
+        WaitForSingleObject(s_hRelease, INFINITE);
+        InterlockedExchange(&s_fCallbackDone, 1);
+    };
+    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(s_hEntered, 30000));
+
+    LONG fDoneWhenUnsubscribed = -1;
+    std::thread unsubscriber([&] {
+        EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+        fDoneWhenUnsubscribed = InterlockedCompareExchange(&s_fCallbackDone, 0, 0);
+    });
+    // Give the unsubscribe a chance to be waiting before the callback is let go; if it is
+    // not yet, the check below holds trivially.
+    Sleep(200);
+    SetEvent(s_hRelease);
+    unsubscriber.join();
+    EXPECT_EQ(1, fDoneWhenUnsubscribed);
+    ExpectNoMoreDeliveries(stateName, log);
+    EXPECT_EQ(1u, log.Count());
+}
+
+TEST(StateNotify, UnsubscribeRacingTheFirstDeliveryIsSafe)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+    for (int i = 0; i < 40; i++)
+    {
+        CDeliveryLog log;
+        PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
+        if (i % 2 == 1)
+        {
+            SwitchToThread();
+        }
+        EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+        // The log goes out of scope here: a callback after the unsubscribe would touch freed
+        // memory.
+        EXPECT_LE(log.Count(), 1u);
+    }
+}
+
+namespace
+{
+typedef NTSTATUS (*PFN_SUBSCRIBE_SELF_ENDING)(WNF_STATE_NAME, HANDLE, HANDLE);
+typedef NTSTATUS (*PFN_SUBSCRIBE_PLAIN)(WNF_STATE_NAME);
+typedef NTSTATUS (*PFN_UNSUBSCRIBE_PLAIN)();
+const wchar_t c_wszTestDll[] = L"statenotifytest.dll";
+
+template <class PFN>
+PFN TestDllExport(HMODULE hModule, const char *szName)
+{
+    return reinterpret_cast<PFN>(reinterpret_cast<void *>(GetProcAddress(hModule, szName)));
+}
+
+// The DLL goes once the last reference is gone; a thread of the pool may still be on its
+// way out of it, so this waits (a hang limit, not a measurement).
+bool TestDllUnloads()
+{
+    for (int i = 0; i < 3000 && GetModuleHandleW(c_wszTestDll) != nullptr; i++)
+    {
+        Sleep(10);
+    }
+    return GetModuleHandleW(c_wszTestDll) == nullptr;
+}
+} // namespace
+
+// The service DLL may be unloaded as soon as its stop is reported, and its launcher ends its
+// subscription from inside the subscription's callback: the code the callback returns into
+// must stay loaded until the callback has left it.
+TEST(StateNotify, ModuleOfACallbackThatUnsubscribedStaysUntilTheCallbackReturns)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    HANDLE hUnsubscribed = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    HANDLE hGo = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    HMODULE hDll = LoadLibraryW((testsupport::BinDir() + c_wszTestDll).c_str());
+    ASSERT_NE(nullptr, hDll);
+    auto pfnSubscribe = TestDllExport<PFN_SUBSCRIBE_SELF_ENDING>(hDll, "SubscribeSelfEnding");
+    ASSERT_NE(nullptr, pfnSubscribe);
+    ASSERT_EQ(STATUS_SUCCESS, pfnSubscribe(stateName, hUnsubscribed, hGo));
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(hUnsubscribed, 30000));
+
+    // The subscription has ended, as far as its owner knows, and the owner lets go.
+    FreeLibrary(hDll);
+    EXPECT_NE(nullptr, GetModuleHandleW(c_wszTestDll));
+    SetEvent(hGo);
+    EXPECT_TRUE(TestDllUnloads());
+    CloseHandle(hUnsubscribed);
+    CloseHandle(hGo);
+}
+
+TEST(StateNotify, EndedSubscriptionLeavesItsModuleFree)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    HMODULE hDll = LoadLibraryW((testsupport::BinDir() + c_wszTestDll).c_str());
+    ASSERT_NE(nullptr, hDll);
+    auto pfnSubscribe = TestDllExport<PFN_SUBSCRIBE_PLAIN>(hDll, "SubscribePlain");
+    auto pfnUnsubscribe = TestDllExport<PFN_UNSUBSCRIBE_PLAIN>(hDll, "UnsubscribePlain");
+    ASSERT_NE(nullptr, pfnSubscribe);
+    ASSERT_NE(nullptr, pfnUnsubscribe);
+    ASSERT_EQ(STATUS_SUCCESS, pfnSubscribe(stateName));
+    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
+    EXPECT_EQ(STATUS_SUCCESS, pfnUnsubscribe());
+    FreeLibrary(hDll);
+    EXPECT_TRUE(TestDllUnloads());
+}
+
+// The store is an ordinary registry value that anybody with the rights can overwrite: what
+// no publisher writes is refused by the query, skipped by subscribers, and repaired by the
+// next publication.
+TEST(StateNotify, ValueNoPublisherWroteIsRefusedThenRepaired)
+{
+    struct Case
+    {
+        const char *szWhat;
+        DWORD dwType;
+        std::vector<BYTE> vbValue;
+    };
+    const Case rgCases[] = {
+        {"text", REG_SZ, {'x', 0, 0, 0}},
+        {"shorter than a stamp", REG_BINARY, {1, 0, 0}},
+        {"stamp 0", REG_BINARY, {0, 0, 0, 0, 9}},
+        {"more data than a state holds", REG_BINARY,
+         std::vector<BYTE>(sizeof(WNF_CHANGE_STAMP) + WNF_STATE_MAX_DATA_SIZE + 1, 1)},
+    };
+    for (const Case &c : rgCases)
+    {
+        WNF_STATE_NAME stateName = NewStateName();
+        CDeliveryLog log;
+        PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
+        std::wstring wstrKey = L"SOFTWARE\\Telvane\\Platform\\StateNotification\\" +
+                               platformtest::StateNameText(stateName).substr(2);
+        ASSERT_EQ(ERROR_SUCCESS,
+                  RegSetKeyValueW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), L"Data", c.dwType,
+                                  c.vbValue.data(), static_cast<DWORD>(c.vbValue.size())))
+            << c.szWhat;
+
+        BYTE rgb[WNF_STATE_MAX_DATA_SIZE];
+        ULONG cb = sizeof(rgb);
+        WNF_CHANGE_STAMP stamp = 0;
+        EXPECT_EQ(static_cast<NTSTATUS>(0xC0070000 | ERROR_INVALID_DATA),
+                  NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, rgb, &cb))
+            << c.szWhat;
+
+        ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 6, &stamp)) << c.szWhat;
+        EXPECT_EQ(1u, stamp) << c.szWhat;
+        ASSERT_TRUE(log.WaitForStamp(1)) << c.szWhat;
+        EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
+        std::vector<Delivery> rg = log.Deliveries();
+        ASSERT_EQ(1u, rg.size()) << c.szWhat;
+        EXPECT_EQ(6u, ValueOf(rg[0].vbData)) << c.szWhat;
+    }
+}
