@@ -2,6 +2,38 @@
 #include "servicelib/diagnostics.h"
 #include "servicelib/eventtrace.h"
 #include "service/statesubscription.h"
+#include "service/udptestcommandline.h"
+#include "service/udptestpolicy.h"
+#include "platform/securityruntime/securityruntime.h"
+#include "platform/wifi/wifiuser.h"
+
+#include <strsafe.h>
+
+namespace
+{
+// The mains-power state: 0 while the phone runs on mains power.
+const WNF_STATE_NAME c_ullPowerSourceStateName = 0x41C61D22A3BC2875ull;
+
+const wchar_t c_wszTestApplication[] = L"C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe";
+const wchar_t c_wszTestChamber[] = L"ZoRiVirOruz";
+const wchar_t c_wszTestChamberInstance[] = L"{5B04B775-356B-4AA0-AAF8-6491FFEA562E}";
+const size_t c_cchTestCommandLine = 256;
+// The phone's startup block is shorter than this platform's STARTUPINFOW.
+const DWORD c_cbTestStartupInfo = 68;
+static_assert(c_cbTestStartupInfo <= sizeof(STARTUPINFOW), "the startup block fits");
+
+// The adapter's wide address text, narrowed for the command line: the low
+// byte of each of the first (at most) 16 characters, up to the first zero.
+std::string LauncherNarrowAddress(const WCHAR *pwch, size_t cchMax)
+{
+    std::string str;
+    for (size_t i = 0; i < cchMax && pwch[i] != L'\0'; i++)
+    {
+        str += static_cast<char>(pwch[i] & 0xFF);
+    }
+    return str;
+}
+} // namespace
 
 CUDPTestLauncher::CUDPTestLauncher()
     : m_hProcess(INVALID_HANDLE_VALUE)
@@ -19,6 +51,18 @@ CUDPTestLauncher::CUDPTestLauncher()
 
 CUDPTestLauncher::~CUDPTestLauncher()
 {
+    // Only an unload without a stop finds a test still tracked; its wait goes first, so that
+    // it never fires on a closed handle.
+    if (m_hWait != nullptr)
+    {
+        UnregisterWaitEx(m_hWait, INVALID_HANDLE_VALUE);
+        m_hWait = nullptr;
+    }
+    if (m_hProcess != INVALID_HANDLE_VALUE)
+    {
+        CloseHandle(m_hProcess);
+        m_hProcess = INVALID_HANDLE_VALUE;
+    }
     if (!m_hDestroyed.Close())
     {
         FATAL_ERROR(L"CUDPTestLauncher::~CUDPTestLauncher", L"CloseHandle", GetLastError());
@@ -91,16 +135,216 @@ void CUDPTestLauncher::Dispatch_Destroy()
 void CUDPTestLauncher::Dispatch_BacklightChanged(ULONG_PTR ulBacklightOn)
 {
     TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - backlight toggled");
-    // A change queued before the destroy request must not start anything after it. The test
-    // policy and the launch come here.
-    if (m_fDestroying || ulBacklightOn == 1)
+    if (ulBacklightOn == 1)
     {
         return;
     }
+    // A change that was already on its way when the destroy request came runs after it; the
+    // destroyed event may be set already, so nothing may start any more.
+    if (m_fDestroying)
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChanged() - destroying, ignoring this "
+                     "call");
+        return;
+    }
+    if (m_hProcess != INVALID_HANDLE_VALUE)
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChanged() - process is still running, "
+                     "ignoring this call");
+        return;
+    }
+    if (!m_fConfigLoaded)
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - loading UDP config");
+        m_fConfigLoaded = true;
+        ResetUdpConfig(&m_config);
+        // A missing or broken file, or an expired policy, is fetched again on top of what the
+        // file gave.
+        if (FAILED(LoadUdpConfig(&m_config)) || IsConfigExpired(&m_config))
+        {
+            RefreshUdpConfig(&m_config);
+        }
+    }
+    if (IsConfigExpired(&m_config))
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - config expired, "
+                     "refreshing");
+        // A refresh that fails here leaves the reset record: no test until the next refresh.
+        ResetUdpConfig(&m_config);
+        RefreshUdpConfig(&m_config);
+    }
+    if (!ShouldRunTest())
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - asked not to run test");
+        return;
+    }
+
+    HANDLE hProcess = INVALID_HANDLE_VALUE;
+    HRESULT hr = LaunchUdpTest(&m_config, &hProcess);
+    if (hProcess == INVALID_HANDLE_VALUE)
+    {
+        return;
+    }
+    // Also when the policy could not be saved afterwards (hr): the process runs, and a second
+    // test must not start beside it.
+    TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - UDP app launched");
+    if (FAILED(hr))
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChanged() - policy not saved, "
+                     "tracking the process anyway");
+    }
+    if (!RegisterWaitForSingleObject(&m_hWait, hProcess, ProcessExitCallback, this, INFINITE,
+                                     WT_EXECUTEONLYONCE))
+    {
+        FATAL_ERROR(L"CUDPTestLauncher::Dispatch_BacklightChanged", L"RegisterWaitForSingleObject",
+                    GetLastError());
+    }
+    m_hProcess = hProcess;
+}
+
+bool CUDPTestLauncher::ShouldRunTest()
+{
+    if (!m_config.enabled)
+    {
+        TelvaneTraceUdpFailure("Not enabled", 0);
+        return false;
+    }
+    // A saved empty relay name reads back as null; neither it nor a relay without a port can
+    // be tested against.
+    if (!UdpConfigHasRelay(m_config) || m_config.relayPort == 0)
+    {
+        TelvaneTraceUdpFailure("No relay to test against", 0);
+        return false;
+    }
+    if (m_config.acOnly)
+    {
+        ULONG ulPowerSource = 0;
+        ULONG cbPowerSource = sizeof(ulPowerSource);
+        NTSTATUS status = NtQueryWnfStateData(&c_ullPowerSourceStateName, nullptr, nullptr, nullptr,
+                                              &ulPowerSource, &cbPowerSource);
+        if (status != 0 || cbPowerSource != sizeof(ulPowerSource) || ulPowerSource != 0)
+        {
+            TelvaneTraceUdpFailure("Not on AC, it's required", 0);
+            return false;
+        }
+    }
+
+    bool fWiFiActive = false;
+    WiFiUserHandle *pHandle = nullptr;
+    HRESULT hr = WiFiUserHandle::OpenHandle(c_dwWiFiUserVersion, &pHandle);
+    if (hr != 0)
+    {
+        TelvaneTraceUdpFailure("WiFiUserHandle::OpenHandle", static_cast<ULONG>(hr));
+    }
+    else
+    {
+        WiFiConnectionState state = WiFiConnectionStateUnknown;
+        WiFiNetwork *pNetwork = nullptr;
+        hr = pHandle->QueryConnectionState(&state, &pNetwork);
+        if (hr != 0)
+        {
+            TelvaneTraceUdpFailure("QueryConnectionState", static_cast<ULONG>(hr));
+        }
+        else if (state == WiFiConnectionStateConnected)
+        {
+            WiFiAdapterInfo info;
+            ZeroMemory(&info, sizeof(info));
+            hr = pHandle->QueryAdapterInfo(&info);
+            if (hr != 0)
+            {
+                TelvaneTraceUdpFailure("QueryAdapterInfo", static_cast<ULONG>(hr));
+            }
+            else
+            {
+                m_config.localIp =
+                    LauncherNarrowAddress(info.wszAddress, ARRAYSIZE(info.wszAddress));
+                fWiFiActive = true;
+            }
+        }
+        delete pNetwork;
+        WiFiUserHandle::CloseHandle(pHandle);
+    }
+    if (!fWiFiActive)
+    {
+        TelvaneTraceUdpFailure("We dont have active WiFi", 0);
+        return false;
+    }
+
+    if (!UdpTestSpacingPassed(m_config.lastTest, m_config.maxTestDay, UdpConfigNow()))
+    {
+        TelvaneTraceUdpFailure("Not time to run", 0);
+        return false;
+    }
+    return true;
+}
+
+HRESULT CUDPTestLauncher::LaunchUdpTest(UdpTestConfig *pConfig, HANDLE *phProcess)
+{
+    *phProcess = INVALID_HANDLE_VALUE;
+    STARTUPINFOW startupInfo;
+    ZeroMemory(&startupInfo, sizeof(startupInfo));
+    startupInfo.cb = c_cbTestStartupInfo;
+    PROCESS_INFORMATION processInfo;
+    ZeroMemory(&processInfo, sizeof(processInfo));
+
+    std::string strArguments;
+    BuildTestCommandLine(*pConfig, strArguments);
+    wchar_t wszCommandLine[c_cchTestCommandLine];
+    HRESULT hr = StringCchPrintfW(wszCommandLine, ARRAYSIZE(wszCommandLine), L"%s %S",
+                                  c_wszTestApplication, strArguments.c_str());
+    TelvaneTraceCommandLine(wszCommandLine);
+    if (FAILED(hr))
+    {
+        // A cut line would test against a wrong relay or port: the test is not started.
+        TelvaneTraceUdpFailure("StringCchPrintf", static_cast<ULONG>(hr));
+        return hr;
+    }
+
+    PSID pSid = nullptr;
+    hr = GetChamberSidFromId(c_wszTestChamber, &pSid);
+    if (FAILED(hr))
+    {
+        TelvaneTraceUdpFailure("GetChamberSidFromId", static_cast<ULONG>(hr));
+    }
+    else
+    {
+        hr = CreateProcessInChamber(pSid, c_wszTestChamberInstance, nullptr, wszCommandLine, FALSE,
+                                    CREATE_NO_WINDOW, nullptr, &startupInfo, &processInfo);
+        if (FAILED(hr))
+        {
+            TelvaneTraceUdpFailure("CreateProcessInChamber", static_cast<ULONG>(hr));
+        }
+        else
+        {
+            CloseHandle(processInfo.hThread);
+            *phProcess = processInfo.hProcess;
+            pConfig->lastTest = UdpConfigNow();
+            hr = SaveUdpConfig(pConfig);
+        }
+    }
+    LocalFree(pSid);
+    return hr;
+}
+
+VOID CALLBACK CUDPTestLauncher::ProcessExitCallback(PVOID pvContext, BOOLEAN fTimedOut)
+{
+    static_cast<CUDPTestLauncher *>(pvContext)->Post(EventCollectionComplete);
 }
 
 void CUDPTestLauncher::Dispatch_CollectionComplete()
 {
+    if (m_hWait != nullptr)
+    {
+        // This handler may run on the wait's own callback thread (the callback's post found
+        // the launcher idle): unregister without waiting, which then reports ERROR_IO_PENDING
+        // and frees the wait when the callback returns.
+        if (!UnregisterWaitEx(m_hWait, nullptr) && GetLastError() != ERROR_IO_PENDING)
+        {
+            FATAL_ERROR(L"CUDPTestLauncher::Dispatch_CollectionComplete", L"UnregisterWaitEx",
+                        GetLastError());
+        }
+        m_hWait = nullptr;
+    }
     if (m_hProcess != INVALID_HANDLE_VALUE)
     {
         if (!CloseHandle(m_hProcess))
