@@ -465,8 +465,15 @@ void TelvaneService::Dispatch_ReportDisconnectedActivity(CServiceActivity *pActi
     auto itOperation = m_mapActivityOperations.find(pActivity);
     if (pActivity == m_pActivityListener)
     {
-        // The listener itself is torn down only by Destroy.
         m_pActivityListener.Release();
+        if (!m_fDestroying)
+        {
+            // The listener's pipe ended before a client connected (under load a client can
+            // come and go before the connect completes): the pipe keeps a listener.
+            CServiceActivity *pListener = new CServiceActivity(this);
+            m_pActivityListener = pListener;
+            pListener->Release(0);
+        }
     }
     else if (itConnected != m_mapConnectedActivities.end())
     {
@@ -538,6 +545,12 @@ void TelvaneService::Dispatch_ReportDisconnectedCollector(CServiceCollector *pCo
     if (pCollector == m_pCollectorListener)
     {
         m_pCollectorListener.Release();
+        if (!m_fDestroying)
+        {
+            CServiceCollector *pListener = new CServiceCollector(this);
+            m_pCollectorListener = pListener;
+            pListener->Release(0);
+        }
     }
     else if (itConnected != m_mapConnectedCollectors.end())
     {

@@ -401,6 +401,8 @@ void AsyncPipe::ConnectCompletedCallback()
             AsyncPipeFatalCode(L"AsyncPipe::ConnectCompletedCallback", TELVANE_WFILE, __LINE__,
                                L"ConnectNamedPipe", m_dwReadError);
         }
+        DebugLog(L"AsyncPipe::ConnectCompletedCallback", L"connect ended with %u\r\n",
+                 m_dwReadError);
         ReleaseConnectSink();
         BreakDataSink();
         break;

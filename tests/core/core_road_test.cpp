@@ -2,6 +2,8 @@
 // files the service writes, read back member by member.
 #include "tests/core/coretestsupport.h"
 
+#include <algorithm>
+
 using namespace coretest;
 
 namespace
@@ -35,6 +37,34 @@ TEST_F(CoreRoad, OneActivityWithOneCollectorIsDeliveredWhole)
     std::vector<DeliveredLog> rgLogs = WaitForLogs(logId, 1);
     ASSERT_EQ(1u, rgLogs.size());
     const rapidjson::Value &log = *rgLogs[0].doc;
+
+    // The members in their order: the header, the end time, the two event groups and the
+    // collector's group in any order, then the end mark.
+    std::vector<std::string> rgNames;
+    for (const auto &member : log.GetObject())
+    {
+        rgNames.push_back(member.name.GetString());
+    }
+    ASSERT_EQ(14u, rgNames.size());
+    EXPECT_EQ(
+        (std::vector<std::string>{"ActivityID", "SessionID", "JsonVersion", "LogID", "WiFiConnID",
+                                  "LogCount", "TimeStamp", "Orvex", "Phone", "ExecutionTime"}),
+        std::vector<std::string>(rgNames.begin(), rgNames.begin() + 10));
+    std::vector<std::string> rgGroups(rgNames.begin() + 10, rgNames.begin() + 13);
+    std::sort(rgGroups.begin(), rgGroups.end());
+    std::vector<std::string> rgExpectedGroups = {"ID" + GuidText(eventA), "ID" + GuidText(eventB),
+                                                 "ID" + GuidText(collectorId)};
+    std::sort(rgExpectedGroups.begin(), rgExpectedGroups.end());
+    EXPECT_EQ(rgExpectedGroups, rgGroups);
+    EXPECT_EQ("LogEnd", rgNames.back());
+    EXPECT_EQ(36u, std::string(log["SessionID"].GetString()).size());
+    EXPECT_EQ(24u, log["JsonVersion"].GetUint());
+    EXPECT_TRUE(log["TimeStamp"].IsUint64());
+    EXPECT_TRUE(log["ExecutionTime"].IsUint64());
+    EXPECT_GE(log["ExecutionTime"].GetUint64(), log["TimeStamp"].GetUint64());
+    EXPECT_TRUE(log["Orvex"].IsObject());
+    EXPECT_TRUE(log["Phone"].IsObject());
+
     EXPECT_EQ(GuidText(activityId), log["ActivityID"].GetString());
     EXPECT_EQ(GuidText(logId), log["LogID"].GetString());
     EXPECT_EQ(1u, log["LogCount"].GetUint());

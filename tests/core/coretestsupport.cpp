@@ -117,15 +117,21 @@ CTraceSession::CTraceSession()
         s_rgTraceLines.clear();
     }
     TraceSetWriteHook(CaptureWrite);
-    TraceProviderEnableCallback(&TELVANE_PROVIDER_GUID, EVENT_CONTROL_CODE_ENABLE_PROVIDER, 4,
-                                0x100, 0, nullptr, &g_TelvaneTraceProvider);
+    Enable(true);
 }
 
 CTraceSession::~CTraceSession()
 {
-    TraceProviderEnableCallback(&TELVANE_PROVIDER_GUID, EVENT_CONTROL_CODE_DISABLE_PROVIDER, 0, 0,
-                                0, nullptr, &g_TelvaneTraceProvider);
+    Enable(false);
     TraceSetWriteHook(nullptr);
+}
+
+void CTraceSession::Enable(bool fEnable)
+{
+    TraceProviderEnableCallback(
+        &TELVANE_PROVIDER_GUID,
+        fEnable ? EVENT_CONTROL_CODE_ENABLE_PROVIDER : EVENT_CONTROL_CODE_DISABLE_PROVIDER,
+        fEnable ? 4 : 0, fEnable ? 0x100 : 0, 0, nullptr, &g_TelvaneTraceProvider);
 }
 
 std::vector<std::string> CTraceSession::Lines() const

@@ -41,6 +41,8 @@ public:
     std::vector<std::string> Lines() const;
     size_t Count(const std::string &text) const; // lines whose text part equals text
     bool WaitFor(const std::string &text, size_t c = 1, DWORD dwTimeoutMs = c_dwWaitMs) const;
+    // Turns the session off and on again: heavy runs need not pay for what nobody reads.
+    void Enable(bool fEnable);
 };
 
 // The coordinator as the shell runs it, with its status readable.
