@@ -58,7 +58,7 @@ protected:
     void TearDown() override
     {
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, WIFI_STANDIN_KEY);
-        ChamberStandInSetFailure(nullptr, S_OK);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
 };
 } // namespace

@@ -2,6 +2,7 @@
 
 #include "service/udptestpolicy.h"
 #include "servicelib/eventtrace.h"
+#include "tests/common/testsupport.h"
 
 #include <gtest/gtest.h>
 #include <algorithm>
@@ -126,8 +127,6 @@ void PreparePolicyFolder()
     ASSERT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigFile));
 }
 } // namespace udptest
-
-#include "tests/common/testsupport.h"
 
 namespace udptest
 {

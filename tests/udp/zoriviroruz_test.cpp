@@ -7,6 +7,7 @@
 #include "tests/udp/udptestsupport.h"
 
 #include <gtest/gtest.h>
+#include <algorithm>
 #include <memory>
 #include <sddl.h>
 
@@ -118,8 +119,9 @@ protected:
     void SetUp() override
     {
         udptest::InstallTestApplication();
-        ChamberStandInSetFailure(nullptr, S_OK);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
+    void TearDown() override { RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY); }
 };
 } // namespace
 
@@ -191,4 +193,25 @@ TEST_F(ZoRiVirOruz, BadArguments)
         EXPECT_EQ(2u, result.dwExitCode) << result.strOutput;
     }
     EXPECT_TRUE(udptest::ResultFiles().empty()); // a refused command line measures nothing
+}
+
+TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
+{
+    // Seventy older results: after one more run the newest 64 are left, the run's among them.
+    for (int i = 0; i < 70; i++)
+    {
+        wchar_t wszName[MAX_PATH];
+        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json", udptest::c_wszResultFolder,
+                   i);
+        ASSERT_TRUE(udptest::WriteWholeFile(wszName, "{}"));
+    }
+    testsupport::ChildResult result = testsupport::RunChild(
+        std::wstring(udptest::c_wszTestAppPath) + L" -count 0 127.0.0.1 47214", {}, 60000);
+    EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
+    std::vector<std::wstring> rgFiles = udptest::ResultFiles();
+    EXPECT_EQ(64u, rgFiles.size());
+    std::sort(rgFiles.begin(), rgFiles.end());
+    EXPECT_EQ(std::wstring(udptest::c_wszResultFolder) + L"\\result-20200101T000007.000Z-1.json",
+              rgFiles.front());
+    EXPECT_EQ(std::wstring::npos, rgFiles.back().find(L"result-2020")); // the new run
 }

@@ -11,6 +11,7 @@
 #include <ws2tcpip.h>
 #include <windows.h>
 
+#include <algorithm>
 #include <stdio.h>
 #include <string>
 #include <vector>
@@ -34,6 +35,8 @@ const ULONGLONG c_ullMaxRunMs = 10 * 60000; // sending stops after ten minutes
 const DWORD c_dwDrainMs = 2000;             // how long echoes may trail the last packet
 
 const wchar_t c_wszResultFolder[] = L"C:\\data\\shareddata\\zoriviroruz\\results";
+// Result files kept in that folder: a phone runs the test for years, so the oldest go.
+const size_t c_cResultsKept = 64;
 
 // A packet starts with its sequence number and the counter value at sending, both
 // little-endian; the rest is filler.
@@ -248,6 +251,37 @@ std::wstring DefaultResultPath(const FILETIME &ftStarted)
                st.wYear, st.wMonth, st.wDay, st.wHour, st.wMinute, st.wSecond, st.wMilliseconds,
                GetCurrentProcessId());
     return wszName;
+}
+
+// Deletes the oldest result files beyond c_cResultsKept. Their names start with the UTC
+// start time, so name order is age order.
+void PruneResults()
+{
+    std::vector<std::wstring> rgwstrNames;
+    WIN32_FIND_DATAW data;
+    std::wstring wstrPattern = std::wstring(c_wszResultFolder) + L"\\result-*.json";
+    HANDLE hFind = FindFirstFileW(wstrPattern.c_str(), &data);
+    if (hFind == INVALID_HANDLE_VALUE)
+    {
+        return;
+    }
+    do
+    {
+        if ((data.dwFileAttributes & FILE_ATTRIBUTE_DIRECTORY) == 0)
+        {
+            rgwstrNames.push_back(data.cFileName);
+        }
+    } while (FindNextFileW(hFind, &data));
+    FindClose(hFind);
+    if (rgwstrNames.size() <= c_cResultsKept)
+    {
+        return;
+    }
+    std::sort(rgwstrNames.begin(), rgwstrNames.end());
+    for (size_t i = 0; i < rgwstrNames.size() - c_cResultsKept; i++)
+    {
+        DeleteFileW((std::wstring(c_wszResultFolder) + L"\\" + rgwstrNames[i]).c_str());
+    }
 }
 
 bool WriteResult(const std::wstring &wstrPath, const std::string &strText)
@@ -543,6 +577,10 @@ int wmain(int argc, wchar_t **argv)
         options.wstrResult.empty() ? DefaultResultPath(result.ftStarted) : options.wstrResult;
     std::string strText = ResultText(options, result);
     bool fWritten = WriteResult(wstrPath, strText);
+    if (options.wstrResult.empty())
+    {
+        PruneResults();
+    }
     printf("%s\n", strText.c_str());
     if (!fWritten)
     {

@@ -1,0 +1,177 @@
+// The Wi-Fi gate against the Wi-Fi stand-in, and the launch of the installed test
+// application through the chamber stand-in against the loopback relay.
+#include "platform/securityruntime/securityruntime.h"
+#include "platform/wifi/wifiuser.h"
+#include "service/udptestlaunch.h"
+#include "service/udptestpolicy.h"
+#include "tests/common/testsupport.h"
+#include "tests/udp/udptestsupport.h"
+
+#include <gtest/gtest.h>
+#include <functional>
+
+using udptest::TraceSession;
+
+namespace
+{
+class UdpTestLaunch : public ::testing::Test
+{
+protected:
+    void SetUp() override
+    {
+        udptest::PreparePolicyFolder();
+        udptest::InstallTestApplication();
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
+    }
+    void TearDown() override
+    {
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, WIFI_STANDIN_KEY);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
+        RemoveDirectoryW(c_wszUdpConfigTempFile);
+        DeleteFileW(c_wszUdpConfigFile);
+    }
+
+    static UdpTestConfig RelayConfig(USHORT usPort)
+    {
+        UdpTestConfig config;
+        ResetUdpConfig(&config);
+        config.localIp = "127.0.0.1";
+        config.relayFqdn = "127.0.0.1";
+        config.relayPort = usPort;
+        config.numPackets = 10;
+        config.delay = 1;
+        return config;
+    }
+
+    // Waits (bounded) for a started test and closes its handle.
+    static void WaitAndClose(HANDLE hProcess)
+    {
+        ASSERT_NE(INVALID_HANDLE_VALUE, hProcess);
+        EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(hProcess, 90000));
+        CloseHandle(hProcess);
+    }
+};
+} // namespace
+
+TEST_F(UdpTestLaunch, WiFiGate)
+{
+    const char *const c_szRefused = "2001|We dont have active WiFi|0";
+    struct
+    {
+        const char *szName;
+        std::function<HRESULT()> set;
+        bool fActive;
+        const char *szAddress;
+        std::vector<std::string> rgstrTrace;
+    } rgCases[] = {
+        {"connected", [] { return WiFiStandInSetConnected(L"10.1.2.3"); }, true, "10.1.2.3", {}},
+        {"a 16-character address",
+         [] { return WiFiStandInSetConnected(L"fe80::1234:5678a"); },
+         true,
+         "fe80::1234:5678a",
+         {}},
+        {"disconnected", [] { return WiFiStandInSetDisconnected(); }, false, "", {c_szRefused}},
+        {"OpenHandle fails",
+         [] { return WiFiStandInSetFailure(L"OpenHandle", c_hrWiFiStandInFailure); },
+         false,
+         "",
+         {"2001|WiFiUserHandle::OpenHandle|80070015", c_szRefused}},
+        {"QueryConnectionState fails",
+         [] { return WiFiStandInSetFailure(L"QueryConnectionState", E_FAIL); },
+         false,
+         "",
+         {"2001|QueryConnectionState|80004005", c_szRefused}},
+        {"QueryAdapterInfo fails",
+         [] {
+             WiFiStandInSetConnected(L"10.1.2.3");
+             return WiFiStandInSetFailure(L"QueryAdapterInfo", c_hrWiFiStandInFailure);
+         },
+         false,
+         "",
+         {"2001|QueryAdapterInfo|80070015", c_szRefused}},
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(c.szName);
+        ASSERT_EQ(S_OK, c.set());
+        TraceSession session;
+        UdpTestConfig config;
+        ResetUdpConfig(&config);
+        EXPECT_EQ(c.fActive, UdpTestWiFiActive(&config));
+        EXPECT_EQ(c.szAddress, config.localIp);
+        EXPECT_EQ(c.rgstrTrace, session.Lines());
+        EXPECT_EQ(0, WiFiStandInLiveHandles());
+        EXPECT_EQ(0, WiFiStandInLiveNetworks());
+    }
+}
+
+TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
+{
+    udptest::RelayProcess relay(47215);
+    ASSERT_TRUE(relay.Listening());
+    UdpTestConfig config = RelayConfig(47215);
+    TraceSession session;
+    uint64_t ullBefore = UdpConfigNow();
+    HANDLE hProcess = INVALID_HANDLE_VALUE;
+    EXPECT_EQ(S_OK, LaunchUdpTest(&config, &hProcess));
+    uint64_t ullAfter = UdpConfigNow();
+    WaitAndClose(hProcess);
+
+    const std::string strCommandLine = "C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
+                                       "127.0.0.1 -delay 1 -count 10 127.0.0.1 47215";
+    EXPECT_EQ(std::vector<std::string>({"2008|" + strCommandLine, "2007"}), session.Lines());
+    EXPECT_LE(ullBefore, config.lastTest);
+    EXPECT_GE(ullAfter, config.lastTest);
+    std::string strSaved;
+    ASSERT_TRUE(udptest::ReadWholeFile(c_wszUdpConfigFile, &strSaved));
+    EXPECT_NE(std::string::npos, strSaved.find("\"LastTest\":" + std::to_string(config.lastTest)));
+    EXPECT_EQ("received 10 echoed 10 end idle\n", relay.WaitForReport());
+    EXPECT_EQ(1u, udptest::ResultFiles().size());
+}
+
+TEST_F(UdpTestLaunch, ChamberFailuresStartNothing)
+{
+    for (const wchar_t *wszCall : {L"GetChamberSidFromId", L"CreateProcessInChamber"})
+    {
+        SCOPED_TRACE(testsupport::Narrow(wszCall));
+        ASSERT_EQ(S_OK, ChamberStandInSetFailure(wszCall, CHAMBER_STANDIN_FAILURE));
+        UdpTestConfig config = RelayConfig(47216);
+        TraceSession session;
+        HANDLE hProcess = nullptr;
+        EXPECT_EQ(CHAMBER_STANDIN_FAILURE, LaunchUdpTest(&config, &hProcess));
+        EXPECT_EQ(INVALID_HANDLE_VALUE, hProcess);
+        EXPECT_EQ(0u, config.lastTest);
+        std::vector<std::string> rgLines = session.Lines();
+        ASSERT_EQ(2u, rgLines.size()); // the command line, the failure; nothing saved
+        EXPECT_EQ(0u, rgLines[0].rfind("2008|", 0));
+        EXPECT_EQ("2001|" + testsupport::Narrow(wszCall) + "|80070005", rgLines[1]);
+    }
+    EXPECT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigFile));
+}
+
+TEST_F(UdpTestLaunch, StartedTestIsHandedOutWhenTheSaveFails)
+{
+    ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr)); // the save cannot write
+    UdpTestConfig config = RelayConfig(47217);
+    config.numPackets = 1;
+    HANDLE hProcess = INVALID_HANDLE_VALUE;
+    HRESULT hr = LaunchUdpTest(&config, &hProcess);
+    EXPECT_TRUE(FAILED(hr));
+    EXPECT_NE(0u, config.lastTest);
+    WaitAndClose(hProcess); // tracked, so no second test could run beside it
+}
+
+TEST_F(UdpTestLaunch, CommandLineThatDoesNotFitIsRefused)
+{
+    UdpTestConfig config = RelayConfig(47218);
+    config.relayFqdn = std::string(200, 'r'); // a valid name, but the line passes 255
+    TraceSession session;
+    HANDLE hProcess = nullptr;
+    EXPECT_EQ(static_cast<HRESULT>(0x8007007A), LaunchUdpTest(&config, &hProcess));
+    EXPECT_EQ(INVALID_HANDLE_VALUE, hProcess);
+    std::vector<std::string> rgLines = session.Lines();
+    ASSERT_EQ(2u, rgLines.size());
+    EXPECT_EQ(2u + 255u, rgLines[0].size() - 3); // "2008|" and the cut line of 255
+    EXPECT_EQ("2001|StringCchPrintf|8007007a", rgLines[1]);
+    EXPECT_EQ(0u, config.lastTest);
+}
