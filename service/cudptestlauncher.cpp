@@ -2,37 +2,13 @@
 #include "servicelib/diagnostics.h"
 #include "servicelib/eventtrace.h"
 #include "service/statesubscription.h"
-#include "service/udptestcommandline.h"
+#include "service/udptestlaunch.h"
 #include "service/udptestpolicy.h"
-#include "platform/securityruntime/securityruntime.h"
-#include "platform/wifi/wifiuser.h"
-
-#include <strsafe.h>
 
 namespace
 {
 // The mains-power state: 0 while the phone runs on mains power.
 const WNF_STATE_NAME c_ullPowerSourceStateName = 0x41C61D22A3BC2875ull;
-
-const wchar_t c_wszTestApplication[] = L"C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe";
-const wchar_t c_wszTestChamber[] = L"ZoRiVirOruz";
-const wchar_t c_wszTestChamberInstance[] = L"{5B04B775-356B-4AA0-AAF8-6491FFEA562E}";
-const size_t c_cchTestCommandLine = 256;
-// The phone's startup block is shorter than this platform's STARTUPINFOW.
-const DWORD c_cbTestStartupInfo = 68;
-static_assert(c_cbTestStartupInfo <= sizeof(STARTUPINFOW), "the startup block fits");
-
-// The adapter's wide address text, narrowed for the command line: the low
-// byte of each of the first (at most) 16 characters, up to the first zero.
-std::string LauncherNarrowAddress(const WCHAR *pwch, size_t cchMax)
-{
-    std::string str;
-    for (size_t i = 0; i < cchMax && pwch[i] != L'\0'; i++)
-    {
-        str += static_cast<char>(pwch[i] & 0xFF);
-    }
-    return str;
-}
 } // namespace
 
 CUDPTestLauncher::CUDPTestLauncher()
@@ -229,44 +205,8 @@ bool CUDPTestLauncher::ShouldRunTest()
         }
     }
 
-    bool fWiFiActive = false;
-    WiFiUserHandle *pHandle = nullptr;
-    HRESULT hr = WiFiUserHandle::OpenHandle(c_dwWiFiUserVersion, &pHandle);
-    if (hr != 0)
+    if (!UdpTestWiFiActive(&m_config))
     {
-        TelvaneTraceUdpFailure("WiFiUserHandle::OpenHandle", static_cast<ULONG>(hr));
-    }
-    else
-    {
-        WiFiConnectionState state = WiFiConnectionStateUnknown;
-        WiFiNetwork *pNetwork = nullptr;
-        hr = pHandle->QueryConnectionState(&state, &pNetwork);
-        if (hr != 0)
-        {
-            TelvaneTraceUdpFailure("QueryConnectionState", static_cast<ULONG>(hr));
-        }
-        else if (state == WiFiConnectionStateConnected)
-        {
-            WiFiAdapterInfo info;
-            ZeroMemory(&info, sizeof(info));
-            hr = pHandle->QueryAdapterInfo(&info);
-            if (hr != 0)
-            {
-                TelvaneTraceUdpFailure("QueryAdapterInfo", static_cast<ULONG>(hr));
-            }
-            else
-            {
-                m_config.localIp =
-                    LauncherNarrowAddress(info.wszAddress, ARRAYSIZE(info.wszAddress));
-                fWiFiActive = true;
-            }
-        }
-        delete pNetwork;
-        WiFiUserHandle::CloseHandle(pHandle);
-    }
-    if (!fWiFiActive)
-    {
-        TelvaneTraceUdpFailure("We dont have active WiFi", 0);
         return false;
     }
 
@@ -276,54 +216,6 @@ bool CUDPTestLauncher::ShouldRunTest()
         return false;
     }
     return true;
-}
-
-HRESULT CUDPTestLauncher::LaunchUdpTest(UdpTestConfig *pConfig, HANDLE *phProcess)
-{
-    *phProcess = INVALID_HANDLE_VALUE;
-    STARTUPINFOW startupInfo;
-    ZeroMemory(&startupInfo, sizeof(startupInfo));
-    startupInfo.cb = c_cbTestStartupInfo;
-    PROCESS_INFORMATION processInfo;
-    ZeroMemory(&processInfo, sizeof(processInfo));
-
-    std::string strArguments;
-    BuildTestCommandLine(*pConfig, strArguments);
-    wchar_t wszCommandLine[c_cchTestCommandLine];
-    HRESULT hr = StringCchPrintfW(wszCommandLine, ARRAYSIZE(wszCommandLine), L"%s %S",
-                                  c_wszTestApplication, strArguments.c_str());
-    TelvaneTraceCommandLine(wszCommandLine);
-    if (FAILED(hr))
-    {
-        // A cut line would test against a wrong relay or port: the test is not started.
-        TelvaneTraceUdpFailure("StringCchPrintf", static_cast<ULONG>(hr));
-        return hr;
-    }
-
-    PSID pSid = nullptr;
-    hr = GetChamberSidFromId(c_wszTestChamber, &pSid);
-    if (FAILED(hr))
-    {
-        TelvaneTraceUdpFailure("GetChamberSidFromId", static_cast<ULONG>(hr));
-    }
-    else
-    {
-        hr = CreateProcessInChamber(pSid, c_wszTestChamberInstance, nullptr, wszCommandLine, FALSE,
-                                    CREATE_NO_WINDOW, nullptr, &startupInfo, &processInfo);
-        if (FAILED(hr))
-        {
-            TelvaneTraceUdpFailure("CreateProcessInChamber", static_cast<ULONG>(hr));
-        }
-        else
-        {
-            CloseHandle(processInfo.hThread);
-            *phProcess = processInfo.hProcess;
-            pConfig->lastTest = UdpConfigNow();
-            hr = SaveUdpConfig(pConfig);
-        }
-    }
-    LocalFree(pSid);
-    return hr;
 }
 
 VOID CALLBACK CUDPTestLauncher::ProcessExitCallback(PVOID pvContext, BOOLEAN fTimedOut)

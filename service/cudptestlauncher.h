@@ -49,9 +49,6 @@ private:
 
     // The gates of one test; each refusal is traced with its reason. Fills localIp.
     bool ShouldRunTest();
-    // Starts the test application in its chamber. *phProcess receives the process whenever
-    // one was started, also when the result is a failure that came after the start.
-    static HRESULT LaunchUdpTest(UdpTestConfig *pConfig, HANDLE *phProcess);
     // The process wait's callback: posts EventCollectionComplete.
     static VOID CALLBACK ProcessExitCallback(PVOID pvContext, BOOLEAN fTimedOut);
 

@@ -106,6 +106,8 @@ void CleanupPrefix()
     ChamberStandInSetFailure(nullptr, S_OK);
     RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     udptest::PreparePolicyFolder();
+    // Whatever subscribes next (a service the prefix starts) finds nothing to do.
+    PublishBacklight(1);
 }
 
 void PublishBacklight(const std::vector<BYTE> &vbData)
