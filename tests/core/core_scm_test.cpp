@@ -33,6 +33,7 @@ protected:
     void TearDown() override
     {
         RunInBin(L"\"" + testsupport::BinDir() + L"telvanerun.exe\" -u");
+        RunInBin(L"regsvr32 /s /u \"" + testsupport::BinDir() + L"platformcomponent.dll\"");
         scmtest::StopAndDelete(c_wszTelvane);
         for (const GUID &logId : m_rgLogIds)
         {

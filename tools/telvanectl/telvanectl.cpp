@@ -321,6 +321,8 @@ int CtlCollector(const CtlOptions &options)
         return CtlFailed("registering the collector", hr);
     }
     printf("registered collector %s\n", CtlGuidText(collectorId).c_str());
+    // Scripts wait for this line before they start the activity it should serve.
+    fflush(stdout);
     fflush(stdout);
 
     DWORD cAnswered = 0;
