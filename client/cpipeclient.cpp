@@ -21,6 +21,8 @@ HRESULT PipeClientResult(DWORD dwError)
 
 // How long to sleep before looking for a listening instance again.
 const DWORD c_dwConnectRetryMs = 5;
+// Longest single wait for a busy pipe's next free instance.
+const DWORD c_dwBusyWaitSliceMs = 1000;
 } // namespace
 
 void CClientHandle::Reset(HANDLE h)
@@ -72,6 +74,18 @@ HRESULT CPipeClient::Connect(const wchar_t *wszPipeName, DWORD dwTimeoutMs)
             return HRESULT_FROM_WIN32(dwError);
         }
         ULONGLONG ullLeft = ullDeadline - ullNow;
+        if (dwError == ERROR_PIPE_BUSY)
+        {
+            // Every instance is taken: wait inside the pipe system until one listens. Asking
+            // again every few milliseconds instead floods it when many clients arrive at once,
+            // and slows the service that is trying to make the next instance. Never 0: that
+            // would mean the server's default wait, which is for ever. The next open tells
+            // whether this client got the instance.
+            WaitNamedPipeW(wszPipeName, ullLeft < c_dwBusyWaitSliceMs
+                                            ? static_cast<DWORD>(ullLeft) + 1
+                                            : c_dwBusyWaitSliceMs);
+            continue;
+        }
         Sleep(ullLeft < c_dwConnectRetryMs ? static_cast<DWORD>(ullLeft) : c_dwConnectRetryMs);
     }
 

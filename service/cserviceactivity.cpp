@@ -295,7 +295,7 @@ void CServiceActivity::OnEventPart(const PIPE_MESSAGE &message)
             break;
         }
         m_cbHeld += vbEvent.size();
-        m_queueHeld.push_back(HeldEvent{eventId, std::move(vbEvent)});
+        m_rgHeld.push_back(HeldEvent{eventId, std::move(vbEvent)});
         break;
     }
     }
@@ -333,11 +333,11 @@ void CServiceActivity::Dispatch_SetServiceOperation(CServiceOperation *pOperatio
     {
         m_pOperation = pOperation;
     }
-    while (!m_queueHeld.empty())
+    for (const HeldEvent &held : m_rgHeld)
     {
-        Deliver(m_queueHeld.front().eventId, m_queueHeld.front().vb);
-        m_queueHeld.pop_front();
+        Deliver(held.eventId, held.vb);
     }
+    std::vector<HeldEvent>().swap(m_rgHeld);
     m_cbHeld = 0;
     if (m_fDisconnectHeld)
     {

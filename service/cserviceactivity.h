@@ -15,7 +15,6 @@
 #include "inc/taggedrefcount.h"
 
 #include <atomic>
-#include <deque>
 #include <vector>
 
 class TelvaneService;
@@ -119,7 +118,8 @@ private:
     TelvaneService *m_pService;
     CTaggedPtr<CServiceOperation, 25> m_pOperation;
     CPipeReassembly m_reassembly;
-    std::deque<HeldEvent> m_queueHeld;
+    // Allocates nothing until an event has to wait: most connections never need it.
+    std::vector<HeldEvent> m_rgHeld;
     size_t m_cbHeld;
     TaggedRefCount<c_cServiceTags> m_refs;
 };

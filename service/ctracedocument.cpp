@@ -16,6 +16,12 @@ const wchar_t c_wszConnIdValue[] = L"ConnID";
 const wchar_t c_wszZeroGuid[] = L"00000000-0000-0000-0000-000000000000";
 const DWORD c_cchPhoneBuffer = 1024;
 
+// What a log's text holds beside the record values: the header with the device description,
+// each record's {"TimeStamp":...,"Value":} and each group's "ID<guid>":[].
+const size_t c_cbHeaderEstimate = 4096;
+const size_t c_cbRecordOverheadEstimate = 48;
+const size_t c_cbGroupOverheadEstimate = 48;
+
 const char *const c_rgszPhoneItemKeys[c_cPhoneInformationItems] = {
     "Manufacturer",
     "RomVersion",
@@ -58,6 +64,7 @@ CTraceDocument::CTraceDocument()
     , m_EventGroups(8)
     , m_ulLogCount(1)
     , m_cbRecorded(0)
+    , m_cRecords(0)
     , m_pfnTimeConversion(nullptr)
 {
     m_EventGroups.max_load_factor(1.0f);
@@ -247,6 +254,7 @@ void CTraceDocument::RecordEvent(const GUID &id, const BYTE *pbValue, size_t cbV
         m_cbRecorded += strEscaped.size() + 2;
     }
     itGroup->second->AddObject(pRecord);
+    m_cRecords++;
 }
 
 void CTraceDocument::AddExecutionTime()
@@ -269,12 +277,18 @@ void CTraceDocument::CloseLog()
 
 void CTraceDocument::FlushAndRestart(bool fCompleted)
 {
+    size_t cGroups = m_EventGroups.size();
     CloseLog();
     TelvaneTrace("CServiceOperation::Reading User Preference key");
     if (TraceSinks::IsCrowdsourcingEnabled())
     {
         m_pTrace->AddBool("LogEnd", fCompleted);
+        // Sized up front: growing a text of megabytes step by step costs more than writing
+        // it (each step copies, and fresh pages of a large block fault in one by one).
         std::string strText;
+        strText.reserve(c_cbHeaderEstimate + m_cbRecorded +
+                        m_cRecords * c_cbRecordOverheadEstimate +
+                        cGroups * c_cbGroupOverheadEstimate);
         m_pTrace->ToString(strText);
         TraceSinks::DeliverTrace(strText.data(), strText.size());
     }
@@ -282,6 +296,7 @@ void CTraceDocument::FlushAndRestart(bool fCompleted)
     m_ulLogCount++;
     BeginLog(false);
     m_cbRecorded = 0;
+    m_cRecords = 0;
 }
 
 ULONG CTraceDocument::LogCount() const

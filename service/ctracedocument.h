@@ -91,5 +91,6 @@ private:
     EventGroupMap m_EventGroups;
     ULONG m_ulLogCount;
     size_t m_cbRecorded;
+    size_t m_cRecords; // since the last flush: with m_cbRecorded, sizes the log's text
     PFN_SYSTEM_TIME_TO_FILE_TIME m_pfnTimeConversion;
 };

@@ -24,15 +24,24 @@ const wchar_t c_wszTestValue[] = L"EnableTestLogging";
 const wchar_t c_wszProfileName[] = L"ZARI_DavoDuvuri_Z1";
 const DWORD c_rgdwProfileSettings[8] = {0xFFFFFFFF, 1, 1, 0, 1, 1, 4096, 500};
 
+PFN_TRACE_WRITE_FILE s_pfnWriteFile = nullptr;
+
 // Writes every byte, going on after short writes; false at the first failure.
 bool WriteAll(HANDLE hFile, const char *pchText, size_t cchText)
 {
+    PFN_TRACE_WRITE_FILE pfnWriteFile = s_pfnWriteFile != nullptr ? s_pfnWriteFile : WriteFile;
     while (cchText > 0)
     {
         DWORD cbChunk = cchText > 0x40000000 ? 0x40000000 : static_cast<DWORD>(cchText);
         DWORD cbWritten = 0;
-        if (!WriteFile(hFile, pchText, cbChunk, &cbWritten, nullptr))
+        if (!pfnWriteFile(hFile, pchText, cbChunk, &cbWritten, nullptr))
         {
+            return false;
+        }
+        // A write that reports success without progress would loop for ever.
+        if (cbWritten == 0)
+        {
+            SetLastError(ERROR_WRITE_FAULT);
             return false;
         }
         pchText += cbWritten;
@@ -141,6 +150,11 @@ HRESULT MakeTraceFileName(std::wstring &wstrPath)
     wstrPath += reinterpret_cast<const wchar_t *>(wszUuid);
     RpcStringFreeW(&wszUuid);
     return S_OK;
+}
+
+void SetWriteFileForTest(PFN_TRACE_WRITE_FILE pfnWriteFile)
+{
+    s_pfnWriteFile = pfnWriteFile;
 }
 
 void WriteTraceToVantor(const char *pchText, size_t cchText)

@@ -29,6 +29,13 @@ HRESULT WriteTraceToFile(const char *pchText, size_t cchText);
 // S_OK or E_FAIL.
 HRESULT MakeTraceFileName(std::wstring &wstrPath);
 
+// Test seam: the call that writes trace files in place of WriteFile (null: WriteFile
+// again), so that short and failing writes, which the real file system does not make on
+// demand, can be driven. Process-wide; set it only while no log is being delivered.
+typedef BOOL(WINAPI *PFN_TRACE_WRITE_FILE)(HANDLE hFile, LPCVOID pvData, DWORD cbData,
+                                           LPDWORD pcbWritten, LPOVERLAPPED pOverlapped);
+void SetWriteFileForTest(PFN_TRACE_WRITE_FILE pfnWriteFile);
+
 // Submits the text through the crowdsourcing library under the trace's profile; failures
 // are traced, never retried.
 void WriteTraceToVantor(const char *pchText, size_t cchText);

@@ -43,6 +43,9 @@ TEST_F(CoreCoordinator, DuplicateActivityIdRetiresTheFirstAndDeliversBoth)
     std::unique_ptr<CActivityClient> first = StartActivity(activityId, logFirst);
     SendEvent(*first, eventId, "1");
     WaitForStarts(1);
+    // Recorded before the second start; an event still on its way when the first run is
+    // retired would be dropped with its connection.
+    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", 1));
     std::unique_ptr<CActivityClient> second = StartActivity(activityId, logSecond);
     SendEvent(*second, eventId, "2");
 
@@ -72,6 +75,7 @@ TEST_F(CoreCoordinator, ReusedLogIdOfTheSameActivityKeepsBothRuns)
     std::unique_ptr<CActivityClient> first = StartActivity(activityId, logId);
     SendEvent(*first, eventId, "\"first\"");
     WaitForStarts(1);
+    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", 1));
     std::unique_ptr<CActivityClient> second = StartActivity(activityId, logId);
     EXPECT_TRUE(ClosedByService(*first));
     ASSERT_EQ(1u, WaitForLogs(logId, 1).size());

@@ -63,6 +63,7 @@ TEST_F(CoreStop, WithACollectionOutstanding)
     std::unique_ptr<CActivityClient> client = StartActivity(NewGuid(), logId);
     EXPECT_EQ(S_OK, client->SendEvent(eventId, "1", 1));
     ASSERT_TRUE(collector.WaitRequests(1));
+    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", 1));
     Stop();
     // The collection ended with no content when the collector's pipe was closed.
     EXPECT_EQ(1u, m_trace.Count("CServiceCollector::PipeBroken  - ERROR, the pipe was broken "
@@ -85,6 +86,7 @@ TEST_F(CoreStop, WithARetiringOperationDraining)
     std::unique_ptr<CActivityClient> first = StartActivity(activityId, logFirst);
     EXPECT_EQ(S_OK, first->SendEvent(NewGuid(), "1", 1));
     ASSERT_TRUE(collector.WaitRequests(1));
+    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", 1));
     // The second start retires the first operation, which still waits for its collection.
     std::unique_ptr<CActivityClient> second = StartActivity(activityId, NewGuid());
     WaitForStarts(2);

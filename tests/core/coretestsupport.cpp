@@ -160,6 +160,9 @@ bool CTraceSession::WaitFor(const std::string &text, size_t c, DWORD dwTimeoutMs
 
 void EnableFileDelivery()
 {
+    // The service makes only the last folder of the log directory.
+    CreateDirectoryW(L"C:\\Data", nullptr);
+    CreateDirectoryW(L"C:\\Data\\Test", nullptr);
     RegHelperSetDword(c_wszCrowdsourcingKey, L"EnableWifiCrowdsourcing", 3);
     RegHelperSetDword(c_wszTelvaneParametersKey, L"EnableTestLogging", 1);
 }
@@ -277,7 +280,7 @@ void CCollectorThread::Run()
         {
             GUID activityId;
             GUID logId;
-            HRESULT hr = client.WaitForRequest(&activityId, &logId, 50);
+            HRESULT hr = client.WaitForRequest(&activityId, &logId, 250);
             if (hr == HRESULT_FROM_WIN32(ERROR_TIMEOUT))
             {
                 continue;

@@ -57,7 +57,8 @@ public:
     DWORD ExitCode() const { return m_status.dwWin32ExitCode; }
 };
 
-// Sets the delivery values so that every log is written to a file and nothing is submitted.
+// Sets the delivery values so that every log is written to a file and nothing is submitted,
+// and makes the folders above the log directory.
 void EnableFileDelivery();
 
 // One delivered log, parsed strictly, with its file.

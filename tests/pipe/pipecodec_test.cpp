@@ -372,7 +372,7 @@ TEST(PipeReassembly, CapsOneItem)
 {
     CPipeReassembly reassembly;
     Bytes cap(c_cbPipeReassemblyMax, 0x5A);
-    EXPECT_EQ(16u * 1024 * 1024, cap.size());
+    EXPECT_EQ(4u * 1024 * 1024, cap.size());
     EXPECT_EQ(PipePartMore, reassembly.AddPart(cap.data(), cap.size() - 1, false));
     EXPECT_EQ(PipePartComplete, reassembly.AddPart(cap.data(), 1, true));
     EXPECT_EQ(cap.size(), reassembly.Take().size());

@@ -65,7 +65,9 @@ std::vector<std::string> JournalCalls()
 // A registry value's state before a flush: missing, a DWORD, or a string.
 struct ValueState
 {
-    int iKind; // 0: value missing, 1: DWORD, 2: REG_SZ, 3: key missing
+    // 0: value missing, 1: DWORD, 2: REG_SZ, 3: key missing (only for keys no one else uses:
+    // the service's own Parameters key also holds its installation)
+    int iKind;
     DWORD dwValue;
 };
 
@@ -115,7 +117,6 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
         {"preference as the text 4", text(4), dword(1), 0, 0},
         {"preference as a text longer than 4 bytes", text(13), dword(1), 0, 0},
         {"test value missing", dword(3), c_missing, 0, 1},
-        {"test key missing", dword(3), c_keyMissing, 0, 1},
         {"test value 0", dword(3), dword(0), 0, 0},
         {"test value 1", dword(3), dword(1), 1, 0},
         {"test value 2", dword(3), dword(2), 1, 1},
@@ -310,5 +311,107 @@ TEST_F(TraceSinksTest, FailuresOfTheLibraryAreTracedWithItsCode)
         ASSERT_GE(rgCalls.size(), 2u);
         EXPECT_EQ("~CrowdsourcingDataSubmitter_t()", rgCalls[rgCalls.size() - 2]);
         EXPECT_EQ("~CrowdsourcingProfile_t()", rgCalls.back());
+    }
+}
+
+namespace
+{
+// What the trace folder holds each time the sink writes, and how the writes behave.
+std::vector<std::vector<std::wstring>> s_rgFolderDuringWrites;
+DWORD s_cbWriteLimit = 0;   // bytes a call writes at most
+int s_iFailingWrite = 0;    // the call that fails (counted from 1), 0: none
+bool s_fNoProgress = false; // succeed without writing
+int s_cWrites = 0;
+
+BOOL WINAPI SeamWriteFile(HANDLE hFile, LPCVOID pvData, DWORD cbData, LPDWORD pcbWritten,
+                          LPOVERLAPPED pOverlapped)
+{
+    s_rgFolderDuringWrites.push_back(TraceFileNames());
+    *pcbWritten = 0;
+    if (++s_cWrites == s_iFailingWrite)
+    {
+        SetLastError(ERROR_DISK_FULL);
+        return FALSE;
+    }
+    if (s_fNoProgress)
+    {
+        return TRUE;
+    }
+    DWORD cb = cbData < s_cbWriteLimit ? cbData : s_cbWriteLimit;
+    return WriteFile(hFile, pvData, cb, pcbWritten, pOverlapped);
+}
+
+class TraceFileWriteTest : public TraceSinksTest
+{
+protected:
+    void SetUp() override
+    {
+        TraceSinksTest::SetUp();
+        s_rgFolderDuringWrites.clear();
+        s_cbWriteLimit = 100;
+        s_iFailingWrite = 0;
+        s_fNoProgress = false;
+        s_cWrites = 0;
+        TraceSinks::SetWriteFileForTest(SeamWriteFile);
+        AllowDelivery(2);
+    }
+    void TearDown() override
+    {
+        TraceSinks::SetWriteFileForTest(nullptr);
+        TraceSinksTest::TearDown();
+    }
+};
+
+bool IsTemporaryName(const std::wstring &wstrName)
+{
+    return wstrName.size() == 36 + 4 && wstrName.compare(36, 4, L".tmp") == 0;
+}
+} // namespace
+
+TEST_F(TraceFileWriteTest, AReaderSeesOnlyTheTemporaryNameUntilTheFileIsComplete)
+{
+    FlushOneLog();
+    std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
+    ASSERT_EQ(1u, rgSubmissions.size());
+    size_t cbText = rgSubmissions[0].strData.size();
+    // Short writes: the sink goes on until every byte is written.
+    EXPECT_EQ(static_cast<int>((cbText + 99) / 100), s_cWrites);
+    for (const std::vector<std::wstring> &rgNames : s_rgFolderDuringWrites)
+    {
+        ASSERT_EQ(1u, rgNames.size());
+        EXPECT_TRUE(IsTemporaryName(rgNames[0])) << testing::PrintToString(rgNames[0]);
+    }
+    std::vector<std::wstring> rgNames = TraceFileNames();
+    ASSERT_EQ(1u, rgNames.size());
+    EXPECT_EQ(36u, rgNames[0].size());
+    EXPECT_EQ(rgNames[0] + L".tmp", s_rgFolderDuringWrites[0][0]);
+    EXPECT_EQ(rgSubmissions[0].strData,
+              ReadFileText(std::wstring(TraceSinks::c_wszTraceDirectory) + L"\\" + rgNames[0]));
+}
+
+TEST_F(TraceFileWriteTest, AFailedWriteLeavesNoFileAndTheSubmissionStillHappens)
+{
+    struct Row
+    {
+        const char *szCase;
+        int iFailingWrite;
+        bool fNoProgress;
+    };
+    const Row rgRows[] = {
+        {"first write fails", 1, false},
+        {"third write fails", 3, false},
+        {"a write makes no progress", 0, true},
+    };
+    for (const Row &row : rgRows)
+    {
+        SCOPED_TRACE(row.szCase);
+        SubmissionClear();
+        s_cWrites = 0;
+        s_iFailingWrite = row.iFailingWrite;
+        s_fNoProgress = row.fNoProgress;
+        FlushOneLog();
+        EXPECT_TRUE(TraceFileNames().empty());
+        EXPECT_EQ(row.fNoProgress ? 1 : row.iFailingWrite, s_cWrites);
+        EXPECT_EQ(1u, SubmissionList().size());
     }
 }

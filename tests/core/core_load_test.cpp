@@ -1,0 +1,118 @@
+// Many clients at once: every event and every result lands in exactly one delivered log,
+// nothing lost (events sent right after the start included) and nothing duplicated.
+#include "tests/core/coretestsupport.h"
+#include "service/cserviceoperation.h"
+
+#include <set>
+#include <thread>
+
+using namespace coretest;
+
+namespace
+{
+// On a busy two-core machine under Wine a step may wait long for its turn; the test is about
+// what arrives, not how fast.
+const DWORD c_dwLoadStepMs = 240000;
+
+class CoreLoad : public CCoreTest
+{
+};
+} // namespace
+
+TEST_F(CoreLoad, TwoHundredActivitiesAndFiftyCollectors)
+{
+    const size_t cCollectors = 50;
+    const size_t cActivities = 200;
+    const size_t cEvents = 50;
+
+    std::vector<GUID> rgCollectorIds;
+    std::vector<std::unique_ptr<CCollectorThread>> rgCollectors;
+    for (size_t i = 0; i < cCollectors; i++)
+    {
+        rgCollectorIds.push_back(NewGuid());
+        rgCollectors.emplace_back(new CCollectorThread(m_wstrCollectorPipe, rgCollectorIds.back(),
+                                                       "\"r" + std::to_string(i) + "\""));
+    }
+    for (auto &collector : rgCollectors)
+    {
+        ASSERT_TRUE(collector->WaitRegistered());
+    }
+    ASSERT_TRUE(m_trace.WaitFor("TelvaneService::ReportConnectedCollector()", cCollectors));
+    // From here on the service traces into nothing, as it does on a phone without a session.
+    m_trace.Enable(false);
+
+    std::vector<GUID> rgLogIds(cActivities);
+    for (GUID &logId : rgLogIds)
+    {
+        logId = NewGuid();
+        m_rgLogIds.push_back(logId);
+    }
+    GUID eventId = NewGuid();
+    std::mutex failureLock;
+    std::vector<std::string> rgFailures;
+    std::vector<std::thread> rgThreads;
+    for (size_t i = 0; i < cActivities; i++)
+    {
+        rgThreads.emplace_back([&, i] {
+            CActivityClient client(c_dwLoadStepMs);
+            HRESULT hr = client.Connect(m_wstrActivityPipe.c_str());
+            const char *szStep = "connect";
+            if (SUCCEEDED(hr))
+            {
+                szStep = "start";
+                hr = client.Start(NewGuid(), rgLogIds[i]);
+            }
+            for (size_t e = 0; SUCCEEDED(hr) && e < cEvents; e++)
+            {
+                szStep = "event";
+                std::string text = std::to_string(e);
+                hr = client.SendEvent(eventId, text.data(), text.size());
+            }
+            if (SUCCEEDED(hr))
+            {
+                szStep = "stop";
+                hr = client.Stop();
+            }
+            if (FAILED(hr))
+            {
+                std::lock_guard<std::mutex> guard(failureLock);
+                rgFailures.push_back(std::string(szStep) + " " +
+                                     std::to_string(static_cast<unsigned long>(hr)));
+            }
+        });
+    }
+    for (std::thread &t : rgThreads)
+    {
+        t.join();
+    }
+    ASSERT_TRUE(rgFailures.empty()) << rgFailures.size() << " failed, first: " << rgFailures[0];
+    // Every operation has completed and gone once its last log is out.
+    ASSERT_TRUE(WaitUntil([] { return CServiceOperation::LiveCount() == 0; }, c_dwLoadStepMs));
+
+    std::vector<std::string> rgExpectedEvents;
+    for (size_t e = 0; e < cEvents; e++)
+    {
+        rgExpectedEvents.push_back(std::to_string(e));
+    }
+    std::set<std::wstring> files;
+    for (size_t i = 0; i < cActivities; i++)
+    {
+        std::vector<DeliveredLog> rgLogs = LogsOf(rgLogIds[i]);
+        ASSERT_EQ(1u, rgLogs.size()) << i;
+        const rapidjson::Value &log = *rgLogs[0].doc;
+        EXPECT_TRUE(log["LogEnd"].GetBool());
+        EXPECT_EQ(rgExpectedEvents, GroupValues(log, eventId)) << i;
+        for (size_t c = 0; c < cCollectors; c++)
+        {
+            EXPECT_EQ((std::vector<std::string>{"\"r" + std::to_string(c) + "\""}),
+                      GroupValues(log, rgCollectorIds[c]))
+                << i << " " << c;
+        }
+        files.insert(rgLogs[0].wstrPath);
+    }
+    EXPECT_EQ(cActivities, files.size());
+    for (auto &collector : rgCollectors)
+    {
+        EXPECT_EQ(cActivities, collector->RequestLogIds().size());
+    }
+}

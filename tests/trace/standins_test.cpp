@@ -1,0 +1,173 @@
+// The two stand-ins called directly, as the service and other callers use them: argument
+// checks, failure switches and the submission spool's files.
+#include "platform/deviceinfo/deviceinfo.h"
+#include "platform/deviceinfo/deviceinfocontrol.h"
+#include "platform/submission/submission.h"
+#include "platform/submission/submissioncontrol.h"
+#include "tests/trace/tracetestsupport.h"
+
+#include <gtest/gtest.h>
+
+#include <cwchar>
+#include <string>
+
+using namespace tracetest;
+
+namespace
+{
+class StandInTest : public testing::Test
+{
+protected:
+    void SetUp() override { ResetDeliveryState(); }
+    void TearDown() override { ResetDeliveryState(); }
+};
+
+void FillProfile(CrowdsourcingProfile_t &profile, const wchar_t *wszName)
+{
+    wcscpy(profile.wszProfileName, wszName);
+    for (DWORD i = 0; i < 8; i++)
+    {
+        profile.rgdwSettings[i] = i + 1;
+    }
+}
+} // namespace
+
+TEST_F(StandInTest, QueryPhoneInformationChecksItsArguments)
+{
+    struct Row
+    {
+        const char *szCase;
+        DWORD dwItem;
+        DWORD cchBuffer;
+        DWORD dwFlags;
+        BOOL fExpected;
+        DWORD dwError;
+    };
+    const Row rgRows[] = {
+        {"first item", 0, 1024, 0, TRUE, 0},
+        {"last item", 15, 1024, 0, TRUE, 0},
+        {"item 16", 16, 1024, 0, FALSE, ERROR_INVALID_PARAMETER},
+        {"flags", 0, 1024, 1, FALSE, ERROR_INVALID_PARAMETER},
+        {"empty buffer", 0, 0, 0, FALSE, ERROR_INVALID_PARAMETER},
+        {"buffer one short", 0, 12, 0, FALSE, ERROR_INSUFFICIENT_BUFFER},
+        {"buffer just right", 0, 13, 0, TRUE, 0}, // "Orvex Mobile" and its NUL
+    };
+    for (const Row &row : rgRows)
+    {
+        SCOPED_TRACE(row.szCase);
+        wchar_t wszBuffer[1024];
+        SetLastError(0);
+        EXPECT_EQ(row.fExpected,
+                  QueryPhoneInformation(row.dwItem, wszBuffer, row.cchBuffer, row.dwFlags));
+        if (!row.fExpected)
+        {
+            EXPECT_EQ(row.dwError, GetLastError());
+        }
+    }
+    wchar_t wszBuffer[1024];
+    ASSERT_TRUE(QueryPhoneInformation(PhoneInformationManufacturer, wszBuffer, 1024, 0));
+    EXPECT_STREQ(L"Orvex Mobile", wszBuffer);
+}
+
+TEST_F(StandInTest, GetPhoneBuildInfoFailsWithANegativeResultAndLeavesTheRecord)
+{
+    PHONE_BUILD_INFO build = {};
+    EXPECT_EQ(S_OK, GetPhoneBuildInfo(&build));
+    EXPECT_STREQ(L"WPB_CXE_R1", build.wszBranch);
+    EXPECT_EQ(10586u, build.dwBuildNumber);
+    EXPECT_EQ(E_POINTER, GetPhoneBuildInfo(nullptr));
+
+    // A branch longer than the field is cut to fit with its NUL.
+    ASSERT_TRUE(DeviceInfoSet(L"Branch", std::wstring(100, L'b')));
+    EXPECT_EQ(S_OK, GetPhoneBuildInfo(&build));
+    EXPECT_EQ(std::wstring(63, L'b'), build.wszBranch);
+
+    ASSERT_TRUE(DeviceInfoSetFailing(L"Build", true));
+    PHONE_BUILD_INFO untouched = {};
+    EXPECT_LT(GetPhoneBuildInfo(&untouched), 0);
+    EXPECT_EQ(0, untouched.wszBranch[0]);
+    ASSERT_TRUE(DeviceInfoSetFailing(L"Build", false));
+    EXPECT_EQ(S_OK, GetPhoneBuildInfo(&untouched));
+}
+
+TEST_F(StandInTest, TheSpoolKeepsEachAcceptedSubmissionWhole)
+{
+    // {9e2b3c4d-5f60-4718-89a0-b1c2d3e4f506}
+    const GUID guid = {
+        0x9e2b3c4d, 0x5f60, 0x4718, {0x89, 0xa0, 0xb1, 0xc2, 0xd3, 0xe4, 0xf5, 0x06}};
+    std::string strData("binary\0data\r\n\xff", 15);
+    {
+        CrowdsourcingProfile_t profile;
+        FillProfile(profile, L"Other_Profile");
+        CrowdsourcingDataSubmitter_t submitter(profile, L"https://upload", 7, nullptr);
+        EXPECT_EQ(0u, submitter.Init());
+        EXPECT_EQ(0u, submitter.SubmitData(reinterpret_cast<const BYTE *>(strData.data()),
+                                           static_cast<DWORD>(strData.size()), &guid));
+        EXPECT_EQ(0u, submitter.SubmitData(nullptr, 0, nullptr));
+    }
+    std::vector<SUBMISSION_RECORD> rgRecords = SubmissionList();
+    ASSERT_EQ(2u, rgRecords.size());
+    // Newest first.
+    EXPECT_EQ("", rgRecords[0].strData);
+    EXPECT_EQ("null", rgRecords[0].strGuid);
+    const SUBMISSION_RECORD &record = rgRecords[1];
+    EXPECT_EQ(strData, record.strData);
+    EXPECT_EQ("Other_Profile", record.strProfileName);
+    EXPECT_EQ("https://upload 7 null", record.strTarget);
+    EXPECT_EQ("9e2b3c4d-5f60-4718-89a0-b1c2d3e4f506", record.strGuid);
+    EXPECT_EQ(8u, record.rgdwSettings[7]);
+    EXPECT_LE(rgRecords[1].ullSubmitted, rgRecords[0].ullSubmitted);
+
+    // Only complete files count: a temporary one or a cut one is not listed.
+    std::wstring wstrCut = record.wstrPath.substr(0, record.wstrPath.size() - 4) + L"0.sub";
+    std::string strFile = ReadFileText(record.wstrPath);
+    HANDLE hFile = CreateFileW(wstrCut.c_str(), GENERIC_WRITE, 0, nullptr, CREATE_ALWAYS,
+                               FILE_ATTRIBUTE_NORMAL, nullptr);
+    ASSERT_NE(INVALID_HANDLE_VALUE, hFile);
+    DWORD cbWritten = 0;
+    WriteFile(hFile, strFile.data(), static_cast<DWORD>(strFile.size() - 1), &cbWritten, nullptr);
+    CloseHandle(hFile);
+    EXPECT_EQ(2u, SubmissionList().size());
+}
+
+TEST_F(StandInTest, TheSubmitterRefusesMisuseAndObeysItsFailureSwitches)
+{
+    struct Row
+    {
+        const char *szCase;
+        bool fPrepared; // the profile came from the default constructor
+        const wchar_t *wszName;
+        DWORD dwInitSwitch; // InitResult
+        bool fInit;         // Init is called before SubmitData
+        DWORD dwInitExpected;
+        DWORD dwSubmitExpected;
+    };
+    const Row rgRows[] = {
+        {"normal", true, L"P", 0, true, 0, 0},
+        {"no Init", true, L"P", 0, false, 0, ERROR_INVALID_STATE},
+        {"empty name", true, L"", 0, true, ERROR_INVALID_PARAMETER, ERROR_INVALID_STATE},
+        {"profile not prepared", false, L"P", 0, true, ERROR_INVALID_PARAMETER,
+         ERROR_INVALID_STATE},
+        {"Init told to fail", true, L"P", 0x80004005, true, 0x80004005, ERROR_INVALID_STATE},
+    };
+    for (const Row &row : rgRows)
+    {
+        SCOPED_TRACE(row.szCase);
+        SubmissionClear();
+        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionInitResult, row.dwInitSwitch));
+        CrowdsourcingProfile_t profile;
+        FillProfile(profile, row.wszName);
+        if (!row.fPrepared)
+        {
+            memset(profile.rgbLibraryState, 0, sizeof(profile.rgbLibraryState));
+        }
+        CrowdsourcingDataSubmitter_t submitter(profile, nullptr, 0, nullptr);
+        if (row.fInit)
+        {
+            EXPECT_EQ(row.dwInitExpected, submitter.Init());
+        }
+        EXPECT_EQ(row.dwSubmitExpected,
+                  submitter.SubmitData(reinterpret_cast<const BYTE *>("{}"), 2, nullptr));
+        EXPECT_EQ(row.dwSubmitExpected == 0 ? 1u : 0u, SubmissionList().size());
+    }
+}
