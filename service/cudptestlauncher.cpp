@@ -2,6 +2,14 @@
 #include "servicelib/diagnostics.h"
 #include "servicelib/eventtrace.h"
 #include "service/statesubscription.h"
+#include "service/udptestlaunch.h"
+#include "service/udptestpolicy.h"
+
+namespace
+{
+// The mains-power state: 0 while the phone runs on mains power.
+const WNF_STATE_NAME c_ullPowerSourceStateName = 0x41C61D22A3BC2875ull;
+} // namespace
 
 CUDPTestLauncher::CUDPTestLauncher()
     : m_hProcess(INVALID_HANDLE_VALUE)
@@ -19,6 +27,18 @@ CUDPTestLauncher::CUDPTestLauncher()
 
 CUDPTestLauncher::~CUDPTestLauncher()
 {
+    // Only an unload without a stop finds a test still tracked; its wait goes first, so that
+    // it never fires on a closed handle.
+    if (m_hWait != nullptr)
+    {
+        UnregisterWaitEx(m_hWait, INVALID_HANDLE_VALUE);
+        m_hWait = nullptr;
+    }
+    if (m_hProcess != INVALID_HANDLE_VALUE)
+    {
+        CloseHandle(m_hProcess);
+        m_hProcess = INVALID_HANDLE_VALUE;
+    }
     if (!m_hDestroyed.Close())
     {
         FATAL_ERROR(L"CUDPTestLauncher::~CUDPTestLauncher", L"CloseHandle", GetLastError());
@@ -91,16 +111,132 @@ void CUDPTestLauncher::Dispatch_Destroy()
 void CUDPTestLauncher::Dispatch_BacklightChanged(ULONG_PTR ulBacklightOn)
 {
     TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - backlight toggled");
-    // A change queued before the destroy request must not start anything after it. The test
-    // policy and the launch come here.
-    if (m_fDestroying || ulBacklightOn == 1)
+    if (ulBacklightOn == 1)
     {
         return;
     }
+    // A change that was already on its way when the destroy request came runs after it; the
+    // destroyed event may be set already, so nothing may start any more.
+    if (m_fDestroying)
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChanged() - destroying, ignoring this "
+                     "call");
+        return;
+    }
+    if (m_hProcess != INVALID_HANDLE_VALUE)
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChanged() - process is still running, "
+                     "ignoring this call");
+        return;
+    }
+    if (!m_fConfigLoaded)
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - loading UDP config");
+        m_fConfigLoaded = true;
+        ResetUdpConfig(&m_config);
+        // A missing or broken file, or an expired policy, is fetched again on top of what the
+        // file gave.
+        if (FAILED(LoadUdpConfig(&m_config)) || IsConfigExpired(&m_config))
+        {
+            RefreshUdpConfig(&m_config);
+        }
+    }
+    if (IsConfigExpired(&m_config))
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - config expired, "
+                     "refreshing");
+        // A refresh that fails here leaves the reset record: no test until the next refresh.
+        ResetUdpConfig(&m_config);
+        RefreshUdpConfig(&m_config);
+    }
+    if (!ShouldRunTest())
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - asked not to run test");
+        return;
+    }
+
+    HANDLE hProcess = INVALID_HANDLE_VALUE;
+    HRESULT hr = LaunchUdpTest(&m_config, &hProcess);
+    if (hProcess == INVALID_HANDLE_VALUE)
+    {
+        return;
+    }
+    // Also when the policy could not be saved afterwards (hr): the process runs, and a second
+    // test must not start beside it.
+    TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChangedup  () - UDP app launched");
+    if (FAILED(hr))
+    {
+        TelvaneTrace("CUDPTestLauncher::Dispatch_BacklightChanged() - policy not saved, "
+                     "tracking the process anyway");
+    }
+    if (!RegisterWaitForSingleObject(&m_hWait, hProcess, ProcessExitCallback, this, INFINITE,
+                                     WT_EXECUTEONLYONCE))
+    {
+        FATAL_ERROR(L"CUDPTestLauncher::Dispatch_BacklightChanged", L"RegisterWaitForSingleObject",
+                    GetLastError());
+    }
+    m_hProcess = hProcess;
+}
+
+bool CUDPTestLauncher::ShouldRunTest()
+{
+    if (!m_config.enabled)
+    {
+        TelvaneTraceUdpFailure("Not enabled", 0);
+        return false;
+    }
+    // A saved empty relay name reads back as null; neither it nor a relay without a port can
+    // be tested against.
+    if (!UdpConfigHasRelay(m_config) || m_config.relayPort == 0)
+    {
+        TelvaneTraceUdpFailure("No relay to test against", 0);
+        return false;
+    }
+    if (m_config.acOnly)
+    {
+        ULONG ulPowerSource = 0;
+        ULONG cbPowerSource = sizeof(ulPowerSource);
+        NTSTATUS status = NtQueryWnfStateData(&c_ullPowerSourceStateName, nullptr, nullptr, nullptr,
+                                              &ulPowerSource, &cbPowerSource);
+        if (status != 0 || cbPowerSource != sizeof(ulPowerSource) || ulPowerSource != 0)
+        {
+            TelvaneTraceUdpFailure("Not on AC, it's required", 0);
+            return false;
+        }
+    }
+
+    if (!UdpTestWiFiActive(&m_config))
+    {
+        return false;
+    }
+
+    if (!UdpTestSpacingPassed(m_config.lastTest, m_config.maxTestDay, UdpConfigNow()))
+    {
+        TelvaneTraceUdpFailure("Not time to run", 0);
+        return false;
+    }
+    return true;
+}
+
+VOID CALLBACK CUDPTestLauncher::ProcessExitCallback(PVOID pvContext, BOOLEAN fTimedOut)
+{
+    static_cast<CUDPTestLauncher *>(pvContext)->Post(EventCollectionComplete);
 }
 
 void CUDPTestLauncher::Dispatch_CollectionComplete()
 {
+    if (m_hWait != nullptr)
+    {
+        // This handler may run on the wait's own callback thread (the callback's post found
+        // the launcher idle): unregister without waiting, which then reports ERROR_IO_PENDING
+        // and frees the wait when the callback returns.
+        if (!UnregisterWaitEx(m_hWait, nullptr) && GetLastError() != ERROR_IO_PENDING)
+        {
+            FATAL_ERROR(L"CUDPTestLauncher::Dispatch_CollectionComplete", L"UnregisterWaitEx",
+                        GetLastError());
+        }
+        m_hWait = nullptr;
+    }
     if (m_hProcess != INVALID_HANDLE_VALUE)
     {
         if (!CloseHandle(m_hProcess))

@@ -1,12 +1,14 @@
-// Starts the UDP echo test when the display backlight changes. For now it has its lifecycle
-// only: the backlight notification reaches its queue and is traced, and the coordinator's
-// shutdown drains it. Runs on its own queue; the coordinator owns it by value, subscribes it
-// to the backlight state at start and destroys it at stop.
+// Starts the UDP echo test application when the display backlight changes and the test
+// policy allows it, at most one test process at a time, and watches it until it exits.
+// Runs on its own queue (the backlight notification and the process wait only post to it);
+// the coordinator owns it by value, subscribes it to the backlight state at start and
+// destroys it at stop.
 #pragma once
 
 #include "servicelib/synchronizedobject.h"
 #include "inc/handleholder.h"
 #include "platform/statenotify/statenotify.h"
+#include "service/udptestconfig.h"
 
 #include <windows.h>
 
@@ -45,10 +47,16 @@ private:
     void Dispatch_CollectionComplete();
     void Dispatch_AdvanceDestruction();
 
+    // The gates of one test; each refusal is traced with its reason. Fills localIp.
+    bool ShouldRunTest();
+    // The process wait's callback: posts EventCollectionComplete.
+    static VOID CALLBACK ProcessExitCallback(PVOID pvContext, BOOLEAN fTimedOut);
+
     HANDLE m_hProcess; // INVALID_HANDLE_VALUE when no test runs
     HANDLE m_hWait;
     CKernelHandle m_hDestroyed;
     PWNF_USER_SUBSCRIPTION m_hWnfSubscription;
     bool m_fConfigLoaded;
     bool m_fDestroying;
+    UdpTestConfig m_config;
 };
