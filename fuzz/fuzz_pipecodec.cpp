@@ -10,6 +10,8 @@
 namespace
 {
 const size_t c_cbFuzzCap = 8192;
+// Smaller than two full items, so the two connections together can run out of budget.
+const size_t c_cbFuzzBudget = 12288;
 
 void FuzzCheck(bool f)
 {
@@ -84,6 +86,10 @@ void FuzzMessage(bool fCollector, const uint8_t *pb, size_t cb, CPipeReassembly 
     case PipePartTooLarge:
         FuzzCheck(cbBefore + message.cbPayload > c_cbFuzzCap && pReassembly->Size() == 0);
         break;
+    case PipePartOverBudget:
+        FuzzCheck(cbBefore + message.cbPayload <= c_cbFuzzCap && message.cbPayload != 0 &&
+                  pReassembly->Size() == 0);
+        break;
     }
     FuzzCheck(pReassembly->Size() <= c_cbFuzzCap);
 }
@@ -91,8 +97,9 @@ void FuzzMessage(bool fCollector, const uint8_t *pb, size_t cb, CPipeReassembly 
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *pbData, size_t cbData)
 {
-    CPipeReassembly activity(c_cbFuzzCap);
-    CPipeReassembly collector(c_cbFuzzCap);
+    CPipeReassemblyBudget budget(c_cbFuzzBudget);
+    CPipeReassembly activity(c_cbFuzzCap, &budget);
+    CPipeReassembly collector(c_cbFuzzCap, &budget);
     size_t ib = 0;
     while (ib + 2 <= cbData)
     {
@@ -112,6 +119,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *pbData, size_t cbData)
         FuzzMessage(false, pbMessage, cb, &activity);
         FuzzMessage(true, pbMessage, cb, &collector);
         std::free(pbMessage);
+        // The budget counts exactly the bytes held in unfinished items.
+        FuzzCheck(budget.Used() == activity.Size() + collector.Size());
+        FuzzCheck(budget.Used() <= c_cbFuzzBudget);
         ib += cb;
     }
 
