@@ -174,7 +174,7 @@ DWORD CertGiveKeyOwnContainer(PCCERT_CONTEXT pCertificate, const char **pszStep)
         *pszStep = "acquiring the imported key";
         return GetLastError();
     }
-    // The import may record a key specification the provider does not know (Wine writes
+    // The import may record a key type the provider does not know (Wine writes
     // 3); the key pair is then found under one of the two it does.
     HCRYPTKEY hKey = 0;
     if (!CryptGetUserKey(hSource.Get(), info.dwKeySpec, &hKey) &&
