@@ -1,4 +1,5 @@
 #include "lib/devicecertificate.h"
+#include "inc/lasterror.h"
 #include "inc/handleholder.h"
 #include "lib/orvexjsontrace.h"
 #include "platform/certprovisioning/certprovisioning.h"
@@ -8,17 +9,6 @@
 
 namespace
 {
-HRESULT DeviceCertificateLastError()
-{
-    DWORD dwError = GetLastError();
-    if (dwError == ERROR_SUCCESS)
-    {
-        return E_FAIL;
-    }
-    return static_cast<HRESULT>(dwError) < 0 ? static_cast<HRESULT>(dwError)
-                                             : HRESULT_FROM_WIN32(dwError);
-}
-
 // The same test as the platform's usage search with no find flags: a certificate matches
 // when its usage extension or property lists the identifier, or when it carries neither
 // and is therefore good for every usage.
@@ -81,7 +71,7 @@ HRESULT DeviceCertificateFind(PCCERT_CONTEXT *ppCertificate)
                       CERT_SYSTEM_STORE_CURRENT_USER | CERT_STORE_READONLY_FLAG, L"MY"));
     if (!hStore)
     {
-        hr = DeviceCertificateLastError();
+        hr = HResultFromLastError();
         OrvexJsonTraceCode(OrvexJsonEvent_OpenStore, static_cast<ULONG>(hr));
         return hr;
     }
@@ -98,7 +88,7 @@ HRESULT DeviceCertificateFind(PCCERT_CONTEXT *ppCertificate)
     }
     if (pCertificate == nullptr)
     {
-        hr = DeviceCertificateLastError();
+        hr = HResultFromLastError();
         OrvexJsonTraceCode(OrvexJsonEvent_NoCertificate, static_cast<ULONG>(hr));
         return hr;
     }

@@ -1,4 +1,5 @@
 #include "lib/jsonrequestcontext.h"
+#include "inc/lasterror.h"
 #include "lib/devicecertificate.h"
 #include "lib/jsonreader.h"
 #include "lib/orvexjsontrace.h"
@@ -25,23 +26,10 @@ const wchar_t c_wszGzipHeaders[] =
 
 PFN_ORVEXJSON_QUERY_CM_SESSION volatile s_pfnQueryCmSessionHook = nullptr;
 
-// A failed call's last error as an HRESULT; never a success, even when the call left no
-// error behind.
-HRESULT OrvexJsonLastError()
-{
-    DWORD dwError = GetLastError();
-    if (dwError == ERROR_SUCCESS)
-    {
-        return E_FAIL;
-    }
-    return static_cast<HRESULT>(dwError) < 0 ? static_cast<HRESULT>(dwError)
-                                             : HRESULT_FROM_WIN32(dwError);
-}
-
 // The failing call's HRESULT, after writing its event.
 HRESULT OrvexJsonTraceLastError(const EVENT_DESCRIPTOR &descriptor)
 {
-    HRESULT hr = OrvexJsonLastError();
+    HRESULT hr = HResultFromLastError();
     OrvexJsonTraceCode(descriptor, static_cast<ULONG>(hr));
     return hr;
 }
@@ -93,7 +81,7 @@ HRESULT OrvexJsonSend(const JsonRequest *pRequest, PFN_JSON_REQUEST_COMPLETION p
     pContext->m_hClosedEvent.Reset(CreateEventW(nullptr, FALSE, FALSE, nullptr));
     if (!pContext->m_hClosedEvent)
     {
-        HRESULT hr = OrvexJsonLastError();
+        HRESULT hr = HResultFromLastError();
         delete pContext;
         return hr;
     }

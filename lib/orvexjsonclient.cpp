@@ -1,4 +1,5 @@
 #include "lib/orvexjsonclient.h"
+#include "inc/lasterror.h"
 #include "inc/handleholder.h"
 #include "lib/jsonrequestcontext.h"
 
@@ -31,8 +32,7 @@ HRESULT OrvexJsonSendRequest(const JsonRequest *pRequest, JsonValue **ppRoot)
     waiter.hDoneEvent.Reset(CreateEventW(nullptr, FALSE, FALSE, nullptr));
     if (!waiter.hDoneEvent)
     {
-        DWORD dwError = GetLastError();
-        return dwError != ERROR_SUCCESS ? HRESULT_FROM_WIN32(dwError) : E_FAIL;
+        return HResultFromLastError();
     }
     JsonRequestContext *pContext = nullptr;
     HRESULT hr = OrvexJsonSend(pRequest, OrvexJsonStoreOutcome, &waiter, &pContext);

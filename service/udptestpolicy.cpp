@@ -1,4 +1,5 @@
 #include "service/udptestpolicy.h"
+#include "inc/lasterror.h"
 
 #include "inc/handleholder.h"
 #include "lib/jsonreader.h"
@@ -12,13 +13,6 @@
 namespace
 {
 const DWORD c_cbReadBlock = 512;
-
-// The HRESULT of the last error. A call that failed without setting one still failed.
-HRESULT UdpPolicyLastError()
-{
-    HRESULT hr = HRESULT_FROM_WIN32(GetLastError());
-    return SUCCEEDED(hr) ? E_FAIL : hr;
-}
 
 bool UdpPolicyIsWhiteSpace(char ch)
 {
@@ -95,7 +89,7 @@ HRESULT UdpPolicyReadFile(std::string *pstrText)
                                   FILE_ATTRIBUTE_NORMAL, nullptr));
     if (!hFile)
     {
-        HRESULT hr = UdpPolicyLastError();
+        HRESULT hr = HResultFromLastError();
         TelvaneTraceUdpFailure("CreateFile (read)", static_cast<ULONG>(hr));
         return hr;
     }
@@ -115,7 +109,7 @@ HRESULT UdpPolicyWriteFile(const std::string &strText)
                                   FILE_ATTRIBUTE_NORMAL, nullptr));
     if (!hFile)
     {
-        HRESULT hr = UdpPolicyLastError();
+        HRESULT hr = HResultFromLastError();
         TelvaneTraceUdpFailure("CreateFile (write)", static_cast<ULONG>(hr));
         return hr;
     }
@@ -126,7 +120,7 @@ HRESULT UdpPolicyWriteFile(const std::string &strText)
                    nullptr))
     {
         szStep = "WriteFile";
-        hr = UdpPolicyLastError();
+        hr = HResultFromLastError();
     }
     else if (cbWritten != strText.size())
     {
@@ -136,18 +130,18 @@ HRESULT UdpPolicyWriteFile(const std::string &strText)
     else if (!FlushFileBuffers(hFile.Get()))
     {
         szStep = "FlushFileBuffers";
-        hr = UdpPolicyLastError();
+        hr = HResultFromLastError();
     }
     else if (!hFile.Close())
     {
         szStep = "CloseHandle";
-        hr = UdpPolicyLastError();
+        hr = HResultFromLastError();
     }
     else if (!MoveFileExW(c_wszUdpConfigTempFile, c_wszUdpConfigFile,
                           MOVEFILE_REPLACE_EXISTING | MOVEFILE_WRITE_THROUGH))
     {
         szStep = "MoveFileEx";
-        hr = UdpPolicyLastError();
+        hr = HResultFromLastError();
     }
     if (FAILED(hr))
     {

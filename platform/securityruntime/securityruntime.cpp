@@ -1,4 +1,5 @@
 #include "platform/securityruntime/securityruntime.h"
+#include "inc/lasterror.h"
 
 #include <sddl.h>
 #include <stddef.h>
@@ -50,12 +51,6 @@ namespace
 // Chamber SIDs are app-container SIDs: S-1-15-2 and seven sub-authorities.
 const DWORD c_cChamberRids = 7;
 const DWORD c_dwChamberRidKind = 2;
-
-HRESULT ChamberLastError()
-{
-    HRESULT hr = HRESULT_FROM_WIN32(GetLastError());
-    return SUCCEEDED(hr) ? E_FAIL : hr;
-}
 
 // The failure set for this call, or S_OK. The state is read at every call, so a test in
 // another process can change it while the service runs.
@@ -162,7 +157,7 @@ extern "C" HRESULT WINAPI GetChamberSidFromId(PCWSTR pwszChamberId, PSID *ppSid)
     if (!ConvertStringSidToSidW(wszSid, ppSid))
     {
         *ppSid = nullptr;
-        return ChamberLastError();
+        return HResultFromLastError();
     }
     return S_OK;
 }
@@ -194,7 +189,7 @@ extern "C" HRESULT WINAPI CreateProcessInChamber(PSID pChamberSid, PCWSTR pwszCh
     if (!CreateProcessW(pwszApplicationName, pwszCommandLine, nullptr, nullptr, fInheritHandles,
                         dwCreationFlags, pvEnvironment, nullptr, &si, pProcessInformation))
     {
-        return ChamberLastError();
+        return HResultFromLastError();
     }
     ChamberRecordLaunch(pChamberSid, pwszChamberInstance, pwszCommandLine,
                         pProcessInformation->dwProcessId);
