@@ -147,6 +147,13 @@ struct HandleTraitsThreadpoolWait
     }
 };
 
+struct HandleTraitsService // control-manager and service handles
+{
+    typedef SC_HANDLE Type;
+    static Type Invalid() { return nullptr; }
+    static BOOL Close(Type h) { return CloseServiceHandle(h); }
+};
+
 struct HandleTraitsWinHttp // sessions, connections and requests of the platform HTTP client
 {
     typedef HINTERNET Type;
@@ -162,4 +169,5 @@ typedef CHandleHolder<HandleTraitsModule> CModuleHandle;
 typedef CHandleHolder<HandleTraitsCertStore> CCertStoreHandle;
 typedef CHandleHolder<HandleTraitsCertContext> CCertContextHandle;
 typedef CHandleHolder<HandleTraitsThreadpoolWait> CThreadpoolWaitHandle;
+typedef CHandleHolder<HandleTraitsService> CServiceHandle;
 typedef CHandleHolder<HandleTraitsWinHttp> CWinHttpHandle;

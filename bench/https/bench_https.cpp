@@ -5,7 +5,7 @@
 // of the HTTPS tests in the prefix's stores: run it through run_bench_https.sh.
 #include "lib/orvexjsonclient.h"
 #include "servicelib/diagnostics.h"
-#include "tests/https/testpolicyserver.h"
+#include "tests/common/policyserver.h"
 
 #include <algorithm>
 #include <stdio.h>

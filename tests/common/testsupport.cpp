@@ -1,6 +1,11 @@
 #include "tests/common/testsupport.h"
+#include "inc/handleholder.h"
 #include "servicelib/diagnostics.h"
 
+#include <gtest/gtest.h>
+#include <rpc.h>
+
+#include <algorithm>
 #include <mutex>
 #include <wchar.h>
 
@@ -86,6 +91,14 @@ bool FailureCapture::Contains(const std::wstring &text) const
 {
     std::lock_guard<std::mutex> guard(s_lock);
     return AnyContains(s_rgFailures, text);
+}
+
+void FailureCapture::ExpectNone() const
+{
+    for (const std::wstring &line : Lines())
+    {
+        ADD_FAILURE() << Narrow(line);
+    }
 }
 
 LogCapture::LogCapture()
@@ -225,12 +238,79 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
     return result;
 }
 
+bool WaitUntil(const std::function<bool()> &pred, DWORD dwTimeoutMs)
+{
+    ULONGLONG ullDeadline = GetTickCount64() + dwTimeoutMs;
+    while (!pred())
+    {
+        if (GetTickCount64() >= ullDeadline)
+        {
+            return false;
+        }
+        Sleep(5);
+    }
+    return true;
+}
+
+GUID NewGuid()
+{
+    GUID guid = {};
+    UuidCreate(&guid);
+    return guid;
+}
+
+std::string GuidText(const GUID &guid)
+{
+    RPC_CSTR sz = nullptr;
+    UuidToStringA(const_cast<GUID *>(&guid), &sz);
+    std::string str(reinterpret_cast<const char *>(sz));
+    RpcStringFreeA(&sz);
+    return str;
+}
+
+GUID ParseGuid(const char *szText)
+{
+    GUID guid = {};
+    EXPECT_EQ(RPC_S_OK,
+              UuidFromStringA(reinterpret_cast<RPC_CSTR>(const_cast<char *>(szText)), &guid));
+    return guid;
+}
+
+std::wstring UniqueName(const wchar_t *wszPrefix)
+{
+    // Wine hands out process ids again soon: the start time tells runs apart.
+    static LONG s_lCounter = 0;
+    static const ULONGLONG s_ullStart = GetTickCount64() % 1000000;
+    wchar_t wsz[128];
+    swprintf(wsz, 128, L"%ls_%lu_%llu_%ld", wszPrefix, GetCurrentProcessId(), s_ullStart,
+             InterlockedIncrement(&s_lCounter));
+    return wsz;
+}
+
+std::wstring UniquePipeName(const wchar_t *wszTag)
+{
+    return L"\\\\.\\pipe\\TelvaneTest-" + UniqueName(wszTag);
+}
+
 std::wstring BinDir()
 {
     wchar_t wszPath[MAX_PATH];
     DWORD cch = GetModuleFileNameW(nullptr, wszPath, MAX_PATH);
     std::wstring path(wszPath, cch);
     return path.substr(0, path.find_last_of(L"\\/") + 1);
+}
+
+std::wstring BinCommand(const wchar_t *wszFile)
+{
+    return L"\"" + BinDir() + wszFile + L"\"";
+}
+
+ChildResult RunTelvanectl(const std::wstring &wstrArguments, DWORD dwTimeoutMs)
+{
+    ChildResult result =
+        RunChild(BinCommand(L"telvanectl.exe") + L" " + wstrArguments, {}, dwTimeoutMs);
+    EXPECT_FALSE(result.fTimedOut) << Narrow(wstrArguments);
+    return result;
 }
 
 std::string Narrow(const std::wstring &wstr)
@@ -241,5 +321,171 @@ std::string Narrow(const std::wstring &wstr)
         str.push_back(static_cast<char>(wc));
     }
     return str;
+}
+
+std::wstring Widen(const std::string &str)
+{
+    return std::wstring(str.begin(), str.end());
+}
+
+void HklmSetBytes(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD dwType,
+                  const void *pv, DWORD cb)
+{
+    CRegKeyHandle key;
+    HKEY hKey = nullptr;
+    ASSERT_EQ(ERROR_SUCCESS, RegCreateKeyExW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), 0, nullptr, 0,
+                                             KEY_WRITE, nullptr, &hKey, nullptr));
+    key.Reset(hKey);
+    EXPECT_EQ(ERROR_SUCCESS,
+              RegSetValueExW(hKey, wszValue, 0, dwType, static_cast<const BYTE *>(pv), cb));
+}
+
+void HklmSetDword(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD dwValue)
+{
+    HklmSetBytes(wstrKey, wszValue, REG_DWORD, &dwValue, sizeof(dwValue));
+}
+
+void HklmSetString(const std::wstring &wstrKey, const wchar_t *wszValue,
+                   const std::wstring &wstrValue)
+{
+    HklmSetBytes(wstrKey, wszValue, REG_SZ, wstrValue.c_str(),
+                 static_cast<DWORD>((wstrValue.size() + 1) * sizeof(wchar_t)));
+}
+
+bool HklmReadDword(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdw)
+{
+    DWORD cb = sizeof(*pdw);
+    return RegGetValueW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), wszValue, RRF_RT_REG_DWORD, nullptr,
+                        pdw, &cb) == ERROR_SUCCESS;
+}
+
+bool HklmReadRaw(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdwType,
+                 std::wstring *pwstrData)
+{
+    HKEY hKey = nullptr;
+    if (RegOpenKeyExW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), 0, KEY_READ, &hKey) != ERROR_SUCCESS)
+    {
+        return false;
+    }
+    CRegKeyHandle key(hKey);
+    DWORD cb = 0;
+    LONG lStatus = RegQueryValueExW(hKey, wszValue, nullptr, pdwType, nullptr, &cb);
+    std::vector<BYTE> rgb(cb + sizeof(wchar_t));
+    if (lStatus == ERROR_SUCCESS)
+    {
+        lStatus = RegQueryValueExW(hKey, wszValue, nullptr, pdwType, rgb.data(), &cb);
+    }
+    if (lStatus != ERROR_SUCCESS)
+    {
+        return false;
+    }
+    pwstrData->assign(reinterpret_cast<const wchar_t *>(rgb.data()), cb / sizeof(wchar_t));
+    return true;
+}
+
+void HklmDeleteValue(const std::wstring &wstrKey, const wchar_t *wszValue)
+{
+    RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), wszValue);
+}
+
+void HklmDeleteKey(const std::wstring &wstrKey)
+{
+    RegDeleteTreeW(HKEY_LOCAL_MACHINE, wstrKey.c_str());
+    RegDeleteKeyExW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), 0, 0);
+}
+
+bool ReadFileText(const std::wstring &wstrPath, std::string *pstrText)
+{
+    CFileHandle file(CreateFileW(wstrPath.c_str(), GENERIC_READ,
+                                 FILE_SHARE_READ | FILE_SHARE_WRITE | FILE_SHARE_DELETE, nullptr,
+                                 OPEN_EXISTING, FILE_ATTRIBUTE_NORMAL, nullptr));
+    if (!file.IsValid())
+    {
+        return false;
+    }
+    pstrText->clear();
+    char rgch[65536];
+    DWORD cbRead = 0;
+    while (ReadFile(file.Get(), rgch, sizeof(rgch), &cbRead, nullptr) && cbRead != 0)
+    {
+        pstrText->append(rgch, cbRead);
+    }
+    return true;
+}
+
+std::string ReadFileText(const std::wstring &wstrPath)
+{
+    std::string str;
+    ReadFileText(wstrPath, &str);
+    return str;
+}
+
+bool WriteFileText(const std::wstring &wstrPath, const std::string &strText)
+{
+    CFileHandle file(
+        CreateFileW(wstrPath.c_str(), GENERIC_WRITE, 0, nullptr, CREATE_ALWAYS, 0, nullptr));
+    DWORD cb = 0;
+    return file.IsValid() &&
+           WriteFile(file.Get(), strText.data(), static_cast<DWORD>(strText.size()), &cb,
+                     nullptr) &&
+           cb == strText.size();
+}
+
+std::vector<std::wstring> FileNames(const std::wstring &wstrFolder, const wchar_t *wszPattern)
+{
+    std::vector<std::wstring> rgNames;
+    WIN32_FIND_DATAW data;
+    CFindHandle find(FindFirstFileW((wstrFolder + L"\\" + wszPattern).c_str(), &data));
+    if (!find.IsValid())
+    {
+        return rgNames;
+    }
+    do
+    {
+        if ((data.dwFileAttributes & FILE_ATTRIBUTE_DIRECTORY) == 0)
+        {
+            rgNames.push_back(data.cFileName);
+        }
+    } while (FindNextFileW(find.Get(), &data));
+    std::sort(rgNames.begin(), rgNames.end());
+    return rgNames;
+}
+
+void RemoveTree(const std::wstring &wstrPath)
+{
+    WIN32_FIND_DATAW data;
+    CFindHandle find(FindFirstFileW((wstrPath + L"\\*").c_str(), &data));
+    if (find.IsValid())
+    {
+        do
+        {
+            std::wstring wstrName = data.cFileName;
+            if (wstrName == L"." || wstrName == L"..")
+            {
+                continue;
+            }
+            std::wstring wstrChild = wstrPath + L"\\" + wstrName;
+            if (data.dwFileAttributes & FILE_ATTRIBUTE_DIRECTORY)
+            {
+                RemoveTree(wstrChild);
+            }
+            else
+            {
+                SetFileAttributesW(wstrChild.c_str(), FILE_ATTRIBUTE_NORMAL);
+                DeleteFileW(wstrChild.c_str());
+            }
+        } while (FindNextFileW(find.Get(), &data));
+    }
+    RemoveDirectoryW(wstrPath.c_str());
+}
+
+void CreateFolders(const std::wstring &wstrPath)
+{
+    for (size_t ich = wstrPath.find(L'\\', 3); ich != std::wstring::npos;
+         ich = wstrPath.find(L'\\', ich + 1))
+    {
+        CreateDirectoryW(wstrPath.substr(0, ich).c_str(), nullptr);
+    }
+    CreateDirectoryW(wstrPath.c_str(), nullptr);
 }
 } // namespace testsupport

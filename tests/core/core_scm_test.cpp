@@ -4,7 +4,7 @@
 // clients drains them and the host leaves cleanly (its unload check passed), and a start
 // beside another holder of a pipe name is refused without harm. These tests own "Telvane".
 #include "tests/core/coretestsupport.h"
-#include "tests/service/scmtesthelpers.h"
+#include "tests/common/scmtest.h"
 
 using namespace coretest;
 
@@ -34,7 +34,7 @@ protected:
     {
         RunInBin(L"\"" + testsupport::BinDir() + L"telvanerun.exe\" -u");
         RunInBin(L"regsvr32 /s /u \"" + testsupport::BinDir() + L"platformcomponent.dll\"");
-        scmtest::StopAndDelete(c_wszTelvane);
+        testsupport::ServiceStopAndDelete(c_wszTelvane);
         for (const GUID &logId : m_rgLogIds)
         {
             DeleteLogsOf(logId);
@@ -43,18 +43,18 @@ protected:
 
     void UseTelvaneHost()
     {
-        ASSERT_TRUE(scmtest::SetImagePath(c_wszTelvane, L"\"" + testsupport::BinDir() +
+        ASSERT_TRUE(testsupport::ServiceSetImagePath(c_wszTelvane, L"\"" + testsupport::BinDir() +
                                                             L"telvanehost.exe\" -k OVTCBNetwork"));
     }
 
     // Starts the service and checks the host it runs in; returns its process id.
     DWORD StartIn(const wchar_t *wszHostImage)
     {
-        EXPECT_EQ(0u, scmtest::StartWithArgs(c_wszTelvane, {}));
+        EXPECT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
         SERVICE_STATUS_PROCESS status = {};
-        EXPECT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs, &status))
+        EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs, &status))
             << status.dwCurrentState;
-        scmtest::CServiceProcess host(status.dwProcessId);
+        testsupport::CServiceProcess host(status.dwProcessId);
         EXPECT_NE(std::wstring::npos, host.ImageName().find(wszHostImage));
         return status.dwProcessId;
     }
@@ -63,7 +63,7 @@ protected:
     void ServeAndStopWithClients(const wchar_t *wszHostImage, size_t cActivities)
     {
         DWORD dwProcessId = StartIn(wszHostImage);
-        scmtest::CServiceProcess host(dwProcessId);
+        testsupport::CServiceProcess host(dwProcessId);
         ASSERT_TRUE(host.Opened());
 
         GUID collectorId = NewGuid();
@@ -102,9 +102,9 @@ protected:
         }
         ASSERT_TRUE(collector.WaitRequests(1 + cActivities, 120000));
 
-        EXPECT_EQ(0u, scmtest::Stop(c_wszTelvane));
+        EXPECT_EQ(0u, testsupport::ServiceStop(c_wszTelvane));
         SERVICE_STATUS_PROCESS status = {};
-        EXPECT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_STOPPED, 120000, &status));
+        EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, 120000, &status));
         EXPECT_EQ(0u, status.dwWin32ExitCode);
         // A clean exit: the unload check found nothing left (a failed check ends the host with
         // a fail-fast code).
@@ -139,10 +139,10 @@ TEST_F(CoreScm, StartBesideASquatterIsRefusedWithoutHarm)
                          PIPE_TYPE_MESSAGE | PIPE_READMODE_MESSAGE, 1, 1024, 1024, 0, nullptr);
     ASSERT_NE(INVALID_HANDLE_VALUE, hSquat);
     // Wine's control manager answers 1053 when STOPPED comes before RUNNING.
-    DWORD dwStart = scmtest::StartWithArgs(c_wszTelvane, {});
+    DWORD dwStart = testsupport::ServiceStart(c_wszTelvane, {});
     EXPECT_TRUE(dwStart == 0 || dwStart == ERROR_SERVICE_REQUEST_TIMEOUT) << dwStart;
     SERVICE_STATUS_PROCESS status = {};
-    EXPECT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
+    EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
     EXPECT_EQ(static_cast<DWORD>(ERROR_ALREADY_EXISTS), status.dwWin32ExitCode);
     // The collector pipe was never made: nothing of the service listens.
     EXPECT_FALSE(WaitNamedPipeW(c_wszTelvaneCollectorPipe, 1));
@@ -151,6 +151,6 @@ TEST_F(CoreScm, StartBesideASquatterIsRefusedWithoutHarm)
 
     // Once the name is free the service starts as usual.
     StartIn(L"svchost.exe");
-    EXPECT_EQ(0u, scmtest::Stop(c_wszTelvane));
-    EXPECT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs));
+    EXPECT_EQ(0u, testsupport::ServiceStop(c_wszTelvane));
+    EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs));
 }

@@ -8,7 +8,7 @@
 #include "platform/certprovisioning/certprovisioning.h"
 #include "platform/connectionmanager/connectionmanager.h"
 #include "tests/common/testsupport.h"
-#include "tests/https/testpolicyserver.h"
+#include "tests/common/policyserver.h"
 
 #include <winsock2.h>
 

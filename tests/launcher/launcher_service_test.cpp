@@ -7,7 +7,7 @@
 #include "platform/wifi/wifiuser.h"
 #include "service/udptestpolicy.h"
 #include "platform/endpointdirectory/endpointdirectory.h"
-#include "tests/https/testpolicyserver.h"
+#include "tests/common/policyserver.h"
 
 #include <gtest/gtest.h>
 #include <memory>

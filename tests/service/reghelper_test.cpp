@@ -1,7 +1,7 @@
 // The registry helpers against the prefix's real registry, each test under a key of its own.
 #include "servicelib/reghelper.h"
 #include "tests/common/testsupport.h"
-#include "tests/service/scmtesthelpers.h"
+#include "tests/common/scmtest.h"
 
 #include <gtest/gtest.h>
 
@@ -16,7 +16,7 @@ const DWORD c_dwWaitMs = 10000;
 class RegHelper : public ::testing::Test
 {
 protected:
-    void SetUp() override { m_wstrBase = L"SOFTWARE\\TelvaneTest\\" + scmtest::UniqueName(L"Reg"); }
+    void SetUp() override { m_wstrBase = L"SOFTWARE\\TelvaneTest\\" + testsupport::UniqueName(L"Reg"); }
     void TearDown() override { RegDeleteTreeW(HKEY_LOCAL_MACHINE, m_wstrBase.c_str()); }
 
     std::wstring Path(const wchar_t *wszSub) const { return m_wstrBase + L"\\" + wszSub; }
@@ -76,7 +76,7 @@ TEST_F(RegHelper, StringsGrowPastTheFirstBuffer)
     // Written as the text plus one terminator.
     DWORD dwType = 0;
     std::wstring wstrRaw;
-    ASSERT_TRUE(scmtest::ReadRaw(wstrKey, L"Long", &dwType, &wstrRaw));
+    ASSERT_TRUE(testsupport::HklmReadRaw(wstrKey, L"Long", &dwType, &wstrRaw));
     EXPECT_EQ(static_cast<DWORD>(REG_SZ), dwType);
     EXPECT_EQ(wstrLong + std::wstring(1, L'\0'), wstrRaw);
 
@@ -127,7 +127,7 @@ TEST_F(RegHelper, MultiStringsRoundTripWithoutEmptyEntries)
 
     DWORD dwType = 0;
     std::wstring wstrRaw;
-    ASSERT_TRUE(scmtest::ReadRaw(wstrKey, L"Group", &dwType, &wstrRaw));
+    ASSERT_TRUE(testsupport::HklmReadRaw(wstrKey, L"Group", &dwType, &wstrRaw));
     EXPECT_EQ(static_cast<DWORD>(REG_MULTI_SZ), dwType);
     EXPECT_EQ(std::wstring(L"Telvane\0Other\0Third\0\0", 21), wstrRaw);
 
@@ -145,7 +145,7 @@ TEST_F(RegHelper, MultiStringsRoundTripWithoutEmptyEntries)
 
     // An empty entry would end the list for every other reader: it is not written.
     RegHelperSetMultiString(wstrKey.c_str(), L"Gaps", {L"a", L"", L"b"});
-    ASSERT_TRUE(scmtest::ReadRaw(wstrKey, L"Gaps", &dwType, &wstrRaw));
+    ASSERT_TRUE(testsupport::HklmReadRaw(wstrKey, L"Gaps", &dwType, &wstrRaw));
     EXPECT_EQ(std::wstring(L"a\0b\0\0", 5), wstrRaw);
     EXPECT_EQ((std::vector<std::wstring>{L"a", L"b"}),
               RegHelperGetMultiString(wstrKey.c_str(), L"Gaps"));
@@ -162,7 +162,7 @@ TEST_F(RegHelper, DwordsKeysAndDeletion)
     std::wstring wstrKey = Path(L"Deep\\Er\\Key");
     RegHelperSetDword(wstrKey.c_str(), L"Number", 0x12345678);
     DWORD dw = 0;
-    ASSERT_TRUE(scmtest::ReadDword(wstrKey, L"Number", &dw));
+    ASSERT_TRUE(testsupport::HklmReadDword(wstrKey, L"Number", &dw));
     EXPECT_EQ(0x12345678u, dw);
 
     HKEY hKey = RegHelperCreateKey(wstrKey.c_str());
@@ -170,7 +170,7 @@ TEST_F(RegHelper, DwordsKeysAndDeletion)
     RegHelperCloseKey(hKey);
 
     RegHelperDeleteValue(wstrKey.c_str(), L"Number");
-    EXPECT_FALSE(scmtest::ReadDword(wstrKey, L"Number", &dw));
+    EXPECT_FALSE(testsupport::HklmReadDword(wstrKey, L"Number", &dw));
 
     // The two parts join as they stand: no separator is added between them.
     std::wstring wstrParent = Path(L"Deep\\Er");

@@ -3,7 +3,7 @@
 // the call: Wine accepts them and stores nothing.
 #include "servicelib/reghelper.h"
 #include "tests/common/testsupport.h"
-#include "tests/service/scmtesthelpers.h"
+#include "tests/common/scmtest.h"
 #include "tests/service/testservice.h"
 
 #include <gtest/gtest.h>
@@ -72,7 +72,7 @@ bool GroupValueExists(const std::wstring &wstrGroup)
 {
     DWORD dwType = 0;
     std::wstring wstrData;
-    return scmtest::ReadRaw(c_wszSvchostGroupKey, wstrGroup.c_str(), &dwType, &wstrData);
+    return testsupport::HklmReadRaw(c_wszSvchostGroupKey, wstrGroup.c_str(), &dwType, &wstrData);
 }
 
 // A demand-start test service with resource ids, removed again whatever the test did.
@@ -88,7 +88,7 @@ public:
         m_idsDescription = m_idsLocalizedName + 1;
         m_ulStartType = SERVICE_DEMAND_START;
     }
-    ~CInstallService() override { scmtest::StopAndDelete(ServiceName()); }
+    ~CInstallService() override { testsupport::ServiceStopAndDelete(ServiceName()); }
 };
 
 // Removes a test group's value from the host group key when the test ends, however it ends.
@@ -128,14 +128,14 @@ protected:
 TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
 {
     FailureCapture failures;
-    CInstallService service(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CInstallService service(testsupport::UniqueName(L"TelvaneTestSvc"));
     CService::RegisterService(&service);
     service.RegisterOneService();
     ASSERT_EQ(0u, failures.Count());
 
     std::wstring wstrExe = ExePath();
-    scmtest::SERVICE_RECORD record;
-    ASSERT_TRUE(scmtest::ReadRecord(service.ServiceName(), &record));
+    testsupport::SERVICE_RECORD record;
+    ASSERT_TRUE(testsupport::ServiceReadRecord(service.ServiceName(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_DEMAND_START), record.dwStartType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_ERROR_NORMAL), record.dwErrorControl);
@@ -169,7 +169,7 @@ TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
     EXPECT_EQ(1, service.m_cRegisters);
 
     service.UnregisterOneService();
-    EXPECT_FALSE(scmtest::ServiceExists(service.ServiceName()));
+    EXPECT_FALSE(testsupport::ServiceExists(service.ServiceName()));
     EXPECT_EQ(2, service.m_cUnregisters);
     // A second removal finds nothing and is not an error.
     service.UnregisterOneService();
@@ -184,13 +184,13 @@ TEST_F(ServiceInstall, DefaultsAndSharedProcessForSeveralServices)
     EXPECT_EQ(0u, plain.m_idsLocalizedName);
     EXPECT_EQ(0u, plain.m_idsDescription);
 
-    CInstallService first(scmtest::UniqueName(L"TelvaneTestSvc"));
-    CInstallService second(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CInstallService first(testsupport::UniqueName(L"TelvaneTestSvc"));
+    CInstallService second(testsupport::UniqueName(L"TelvaneTestSvc"));
     CService::RegisterService(&first);
     CService::RegisterService(&second);
     first.RegisterOneService();
-    scmtest::SERVICE_RECORD record;
-    ASSERT_TRUE(scmtest::ReadRecord(first.ServiceName(), &record));
+    testsupport::SERVICE_RECORD record;
+    ASSERT_TRUE(testsupport::ServiceReadRecord(first.ServiceName(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
     EXPECT_EQ(ExePath(), record.wstrBinaryPath);
 }
@@ -198,13 +198,13 @@ TEST_F(ServiceInstall, DefaultsAndSharedProcessForSeveralServices)
 TEST_F(ServiceInstall, ZeroResourceIdsStopAtTheAssertions)
 {
     FailureCapture failures;
-    CTestService service(scmtest::UniqueName(L"TelvaneTestSvc").c_str());
+    CTestService service(testsupport::UniqueName(L"TelvaneTestSvc").c_str());
     CService::RegisterService(&service);
     service.RegisterOneService();
     EXPECT_EQ(2u, failures.Count());
     EXPECT_TRUE(failures.Contains(L"Assertion failure: m_idsLocalizedName != 0"));
     EXPECT_TRUE(failures.Contains(L"Assertion failure: m_idsDescription != 0"));
-    EXPECT_FALSE(scmtest::ServiceExists(service.ServiceName()));
+    EXPECT_FALSE(testsupport::ServiceExists(service.ServiceName()));
     EXPECT_EQ(0, service.m_cRegisters);
     EXPECT_EQ(0, service.m_cUnregisters);
 }
@@ -212,32 +212,32 @@ TEST_F(ServiceInstall, ZeroResourceIdsStopAtTheAssertions)
 TEST_F(ServiceInstall, HostDllValuesAndGroupList)
 {
     FailureCapture failures;
-    std::wstring wstrGroup = scmtest::UniqueName(L"TelvaneTestGroup");
+    std::wstring wstrGroup = testsupport::UniqueName(L"TelvaneTestGroup");
     CGroupCleanup groupCleanup(wstrGroup);
     CTestService::SetHostMode(true, wstrGroup.c_str(), nullptr);
     // Someone else's service in the group stays where it is.
     RegHelperSetMultiString(c_wszSvchostGroupKey, wstrGroup.c_str(), {L"Other"});
 
-    CInstallService alpha(scmtest::UniqueName(L"TelvaneTestSvc"));
-    CInstallService beta(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CInstallService alpha(testsupport::UniqueName(L"TelvaneTestSvc"));
+    CInstallService beta(testsupport::UniqueName(L"TelvaneTestSvc"));
     CService::RegisterService(&alpha);
     CService::RegisterService(&beta);
     const std::wstring a = alpha.ServiceName();
     const std::wstring b = beta.ServiceName();
 
     alpha.RegisterOneService();
-    scmtest::SERVICE_RECORD record;
-    ASSERT_TRUE(scmtest::ReadRecord(a.c_str(), &record));
+    testsupport::SERVICE_RECORD record;
+    ASSERT_TRUE(testsupport::ServiceReadRecord(a.c_str(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
     EXPECT_EQ(L"svchost.exe -k " + wstrGroup, record.wstrBinaryPath);
     // The host DLL is the module that holds the shell: here, the test program.
     DWORD dwType = 0;
     std::wstring wstrDll;
-    ASSERT_TRUE(scmtest::ReadRaw(ParametersKey(a), L"ServiceDll", &dwType, &wstrDll));
+    ASSERT_TRUE(testsupport::HklmReadRaw(ParametersKey(a), L"ServiceDll", &dwType, &wstrDll));
     EXPECT_EQ(static_cast<DWORD>(REG_EXPAND_SZ), dwType);
     EXPECT_EQ(ExePath() + std::wstring(1, L'\0'), wstrDll);
     DWORD dwUnload = 0;
-    ASSERT_TRUE(scmtest::ReadDword(ParametersKey(a), L"ServiceDllUnloadOnStop", &dwUnload));
+    ASSERT_TRUE(testsupport::HklmReadDword(ParametersKey(a), L"ServiceDllUnloadOnStop", &dwUnload));
     EXPECT_EQ(1u, dwUnload);
     EXPECT_EQ((std::vector<std::wstring>{L"Other", a}), GroupList(wstrGroup));
 
@@ -248,7 +248,7 @@ TEST_F(ServiceInstall, HostDllValuesAndGroupList)
     EXPECT_EQ((std::vector<std::wstring>{L"Other", b, a}), GroupList(wstrGroup));
 
     alpha.UnregisterOneService();
-    EXPECT_FALSE(scmtest::ServiceExists(a.c_str()));
+    EXPECT_FALSE(testsupport::ServiceExists(a.c_str()));
     EXPECT_EQ((std::vector<std::wstring>{L"Other", b}), GroupList(wstrGroup));
     beta.UnregisterOneService();
     EXPECT_EQ((std::vector<std::wstring>{L"Other"}), GroupList(wstrGroup));
@@ -261,7 +261,7 @@ TEST_F(ServiceInstall, HostDllValuesAndGroupList)
     EXPECT_FALSE(GroupValueExists(wstrGroup));
 
     // Never installed: nothing to remove, and no error.
-    CInstallService never(scmtest::UniqueName(L"TelvaneTestSvc"));
+    CInstallService never(testsupport::UniqueName(L"TelvaneTestSvc"));
     never.UnregisterOneService();
     EXPECT_FALSE(GroupValueExists(wstrGroup));
     EXPECT_EQ(0u, failures.Count());

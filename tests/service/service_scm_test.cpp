@@ -6,7 +6,7 @@
 #include "servicelib/service.h"
 #include "service/resource.h"
 #include "tests/common/testsupport.h"
-#include "tests/service/scmtesthelpers.h"
+#include "tests/common/scmtest.h"
 
 #include <gtest/gtest.h>
 
@@ -34,7 +34,7 @@ bool GroupValueExists()
 {
     DWORD dwType = 0;
     std::wstring wstrData;
-    return scmtest::ReadRaw(c_wszSvchostGroupKey, c_wszGroup, &dwType, &wstrData);
+    return testsupport::HklmReadRaw(c_wszSvchostGroupKey, c_wszGroup, &dwType, &wstrData);
 }
 
 std::wstring LoadDllString(UINT uId)
@@ -58,28 +58,28 @@ protected:
     void TearDown() override
     {
         RunTelvane(L"-u");
-        scmtest::StopAndDelete(c_wszTelvane);
+        testsupport::ServiceStopAndDelete(c_wszTelvane);
     }
 
     // Starts the service, checks which program hosts it, stops it and sees the host leave.
     void StartAndStop(const wchar_t *wszHostImage)
     {
         SCOPED_TRACE(testsupport::Narrow(wszHostImage));
-        ASSERT_EQ(0u, scmtest::StartWithArgs(c_wszTelvane, {}));
+        ASSERT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
         SERVICE_STATUS_PROCESS status = {};
-        ASSERT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs, &status))
+        ASSERT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs, &status))
             << status.dwCurrentState;
         EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), status.dwServiceType);
         EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP), status.dwControlsAccepted);
 
-        scmtest::CServiceProcess host(status.dwProcessId);
+        testsupport::CServiceProcess host(status.dwProcessId);
         ASSERT_TRUE(host.Opened());
         std::wstring wstrImage = host.ImageName();
         EXPECT_NE(std::wstring::npos, wstrImage.find(wszHostImage))
             << testsupport::Narrow(wstrImage);
 
-        EXPECT_EQ(0u, scmtest::Stop(c_wszTelvane));
-        EXPECT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
+        EXPECT_EQ(0u, testsupport::ServiceStop(c_wszTelvane));
+        EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
         EXPECT_EQ(0u, status.dwWin32ExitCode);
 
         // The host leaves once its only service has stopped.
@@ -94,8 +94,8 @@ TEST_F(TelvaneInstall, RegisterRunUnderSvchostAndUnregister)
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
 
     std::wstring wstrDll = testsupport::BinDir() + L"telvane.dll";
-    scmtest::SERVICE_RECORD record;
-    ASSERT_TRUE(scmtest::ReadRecord(c_wszTelvane, &record));
+    testsupport::SERVICE_RECORD record;
+    ASSERT_TRUE(testsupport::ServiceReadRecord(c_wszTelvane, &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_AUTO_START), record.dwStartType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_ERROR_NORMAL), record.dwErrorControl);
@@ -111,11 +111,11 @@ TEST_F(TelvaneInstall, RegisterRunUnderSvchostAndUnregister)
 
     DWORD dwType = 0;
     std::wstring wstrServiceDll;
-    ASSERT_TRUE(scmtest::ReadRaw(c_wszParameters, L"ServiceDll", &dwType, &wstrServiceDll));
+    ASSERT_TRUE(testsupport::HklmReadRaw(c_wszParameters, L"ServiceDll", &dwType, &wstrServiceDll));
     EXPECT_EQ(static_cast<DWORD>(REG_EXPAND_SZ), dwType);
     EXPECT_EQ(wstrDll, RegHelperGetString(c_wszParameters, L"ServiceDll"));
     DWORD dwUnload = 0;
-    ASSERT_TRUE(scmtest::ReadDword(c_wszParameters, L"ServiceDllUnloadOnStop", &dwUnload));
+    ASSERT_TRUE(testsupport::HklmReadDword(c_wszParameters, L"ServiceDllUnloadOnStop", &dwUnload));
     EXPECT_EQ(1u, dwUnload);
     EXPECT_EQ(1u, GroupEntries());
 
@@ -126,18 +126,18 @@ TEST_F(TelvaneInstall, RegisterRunUnderSvchostAndUnregister)
     // Registering again, even while the service runs, leaves one installation and one entry.
     ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
     EXPECT_EQ(1u, GroupEntries());
-    ASSERT_EQ(0u, scmtest::StartWithArgs(c_wszTelvane, {}));
-    ASSERT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs));
+    ASSERT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
+    ASSERT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs));
     result = RunTelvane(L"-r");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
     EXPECT_EQ(1u, GroupEntries());
     SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(scmtest::QueryStatus(c_wszTelvane, &status));
+    ASSERT_TRUE(testsupport::ServiceQueryStatus(c_wszTelvane, &status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), status.dwCurrentState);
 
     result = RunTelvane(L"-u");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    EXPECT_FALSE(scmtest::ServiceExists(c_wszTelvane));
+    EXPECT_FALSE(testsupport::ServiceExists(c_wszTelvane));
     EXPECT_FALSE(GroupValueExists());
     // Removing what is not installed is not an error.
     EXPECT_EQ(0u, RunTelvane(L"-u").dwExitCode);
@@ -147,16 +147,16 @@ TEST_F(TelvaneInstall, RegisterRunUnderSvchostAndUnregister)
 TEST_F(TelvaneInstall, UnregisterTakesPrecedenceOverRegister)
 {
     ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
-    ASSERT_TRUE(scmtest::ServiceExists(c_wszTelvane));
+    ASSERT_TRUE(testsupport::ServiceExists(c_wszTelvane));
     ASSERT_EQ(0u, RunTelvane(L"-r -u").dwExitCode);
-    EXPECT_FALSE(scmtest::ServiceExists(c_wszTelvane));
+    EXPECT_FALSE(testsupport::ServiceExists(c_wszTelvane));
     EXPECT_FALSE(GroupValueExists());
 }
 
 TEST_F(TelvaneInstall, RunsUnderTelvaneHostWithItsStopCallback)
 {
     ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
-    ASSERT_TRUE(scmtest::SetImagePath(c_wszTelvane, L"\"" + testsupport::BinDir() +
+    ASSERT_TRUE(testsupport::ServiceSetImagePath(c_wszTelvane, L"\"" + testsupport::BinDir() +
                                                         L"telvanehost.exe\" -k OVTCBNetwork"));
     // Only the stop callback runs OnStop under this host: without it STOPPED never comes.
     StartAndStop(L"telvanehost.exe");
@@ -165,12 +165,12 @@ TEST_F(TelvaneInstall, RunsUnderTelvaneHostWithItsStopCallback)
 
     // Here a STOP returns while the service still runs: registering again must see the old
     // installation down before it creates the new one.
-    ASSERT_EQ(0u, scmtest::StartWithArgs(c_wszTelvane, {}));
-    ASSERT_TRUE(scmtest::WaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs));
+    ASSERT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
+    ASSERT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs));
     testsupport::ChildResult result = RunTelvane(L"-r");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    scmtest::SERVICE_RECORD record;
-    ASSERT_TRUE(scmtest::ReadRecord(c_wszTelvane, &record));
+    testsupport::SERVICE_RECORD record;
+    ASSERT_TRUE(testsupport::ServiceReadRecord(c_wszTelvane, &record));
     EXPECT_EQ(L"svchost.exe -k OVTCBNetwork", record.wstrBinaryPath);
     EXPECT_EQ(1u, GroupEntries());
 }

@@ -3,7 +3,7 @@
 #include "servicelib/reghelper.h"
 #include "servicelib/service.h"
 #include "tests/common/testsupport.h"
-#include "tests/service/scmtesthelpers.h"
+#include "tests/common/scmtest.h"
 #include "tests/service/testservice.h"
 
 #include <gtest/gtest.h>
@@ -52,10 +52,10 @@ class CChildServiceHolder
 {
 public:
     CChildServiceHolder()
-        : m_wstrName(scmtest::UniqueName(L"TelvaneTestChild"))
+        : m_wstrName(testsupport::UniqueName(L"TelvaneTestChild"))
         , m_cleanup(m_wstrName)
     {
-        m_fCreated = scmtest::CreateOwnProcess(
+        m_fCreated = testsupport::ServiceCreateOwnProcess(
             m_wstrName.c_str(), Quoted(testsupport::BinDir() + L"servicetest_child.exe"));
     }
     const wchar_t *Name() const { return m_wstrName.c_str(); }
@@ -65,16 +65,16 @@ public:
     // sends STOP; the status the control returned goes to *pStatus.
     ::testing::AssertionResult StartAndHoldStop(SERVICE_STATUS *pStatus)
     {
-        DWORD dwError = scmtest::StartWithArgs(Name(), {L"host", L"hold-stop"});
+        DWORD dwError = testsupport::ServiceStart(Name(), {L"host", L"hold-stop"});
         if (dwError != ERROR_SUCCESS)
         {
             return ::testing::AssertionFailure() << "StartService: " << dwError;
         }
-        if (!scmtest::WaitForState(Name(), SERVICE_RUNNING, c_dwStateWaitMs))
+        if (!testsupport::ServiceWaitForState(Name(), SERVICE_RUNNING, c_dwStateWaitMs))
         {
             return ::testing::AssertionFailure() << "never RUNNING";
         }
-        dwError = scmtest::Control(Name(), SERVICE_CONTROL_STOP, pStatus);
+        dwError = testsupport::ServiceControl(Name(), SERVICE_CONTROL_STOP, pStatus);
         if (dwError != ERROR_SUCCESS)
         {
             return ::testing::AssertionFailure() << "STOP: " << dwError;
@@ -84,7 +84,7 @@ public:
 
 private:
     std::wstring m_wstrName;
-    scmtest::CServiceCleanup m_cleanup;
+    testsupport::CServiceCleanup m_cleanup;
     bool m_fCreated;
 };
 } // namespace
@@ -105,10 +105,10 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
     };
     for (const auto &testCase : rgCases)
     {
-        ASSERT_EQ(0u, scmtest::StartWithArgs(child.Name(), testCase.rgArgs));
+        ASSERT_EQ(0u, testsupport::ServiceStart(child.Name(), testCase.rgArgs));
         SERVICE_STATUS_PROCESS status = {};
         ASSERT_TRUE(
-            scmtest::WaitForState(child.Name(), SERVICE_START_PENDING, c_dwStateWaitMs, &status))
+            testsupport::ServiceWaitForState(child.Name(), SERVICE_START_PENDING, c_dwStateWaitMs, &status))
             << status.dwCurrentState;
         EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), status.dwServiceType);
         EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP), status.dwControlsAccepted);
@@ -116,8 +116,8 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
         EXPECT_EQ(testCase.dwWaitHint, status.dwWaitHint);
 
         // Without a host, STOP runs OnStop in the handler, even before RUNNING.
-        EXPECT_EQ(0u, scmtest::Stop(child.Name()));
-        ASSERT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
+        EXPECT_EQ(0u, testsupport::ServiceStop(child.Name()));
+        ASSERT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
         // The child reports the breakpoints it saw after START_PENDING.
         EXPECT_EQ(static_cast<DWORD>(ERROR_SERVICE_SPECIFIC_ERROR), status.dwWin32ExitCode);
         EXPECT_EQ(testCase.dwBreakpoints, status.dwServiceSpecificExitCode);
@@ -131,20 +131,20 @@ TEST(ServiceMainUnderScm, UserControlNobodyAskedForLeavesTheServiceRunning)
 {
     CChildServiceHolder child;
     ASSERT_TRUE(child.Created());
-    ASSERT_EQ(0u, scmtest::StartWithArgs(child.Name(), {}));
+    ASSERT_EQ(0u, testsupport::ServiceStart(child.Name(), {}));
     SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
-    scmtest::CServiceProcess process(status.dwProcessId);
+    ASSERT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
+    testsupport::CServiceProcess process(status.dwProcessId);
     ASSERT_TRUE(process.Opened());
 
     SERVICE_STATUS statusControl = {};
-    EXPECT_EQ(0u, scmtest::Control(child.Name(), 200, &statusControl));
+    EXPECT_EQ(0u, testsupport::ServiceControl(child.Name(), 200, &statusControl));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
 
     // Still alive: it stops as usual, with no breakpoint seen, and its process leaves cleanly.
-    if (scmtest::Stop(child.Name()) == ERROR_SUCCESS)
+    if (testsupport::ServiceStop(child.Name()) == ERROR_SUCCESS)
     {
-        EXPECT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
+        EXPECT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
         EXPECT_EQ(0u, status.dwServiceSpecificExitCode);
     }
     DWORD dwExitCode = process.WaitForExitCode(c_dwStateWaitMs);
@@ -164,11 +164,11 @@ TEST(ServiceMainUnderScm, StopUnderHostReturnsAtOnceAndStopsWhenOnStopEnds)
     ASSERT_TRUE(child.StartAndHoldStop(&status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
     SERVICE_STATUS_PROCESS statusNow = {};
-    ASSERT_TRUE(scmtest::QueryStatus(child.Name(), &statusNow));
+    ASSERT_TRUE(testsupport::ServiceQueryStatus(child.Name(), &statusNow));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusNow.dwCurrentState);
 
     SetEvent(release.Get());
-    EXPECT_TRUE(scmtest::WaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
+    EXPECT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
 }
 
 // Someone deleted the service while it was stopping (sc stop, sc delete): the record stays,
@@ -184,7 +184,7 @@ TEST(ServiceMainUnderScm, UnregisterOfAStoppingServiceMarkedForDeletion)
 
     // Stopping (OnStop holds until released), then deleted.
     ASSERT_TRUE(child.StartAndHoldStop(nullptr));
-    ASSERT_TRUE(scmtest::Delete(child.Name()));
+    ASSERT_TRUE(testsupport::ServiceDelete(child.Name()));
 
     CTestService service(child.Name());
     CService::RegisterService(&service);
@@ -202,7 +202,7 @@ TEST(ServiceMainUnderScm, UnregisterOfAStoppingServiceMarkedForDeletion)
     CloseHandle(hDone);
     EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
     EXPECT_EQ(0u, failures.Count());
-    EXPECT_FALSE(scmtest::ServiceExists(child.Name()));
+    EXPECT_FALSE(testsupport::ServiceExists(child.Name()));
     EXPECT_EQ(1, service.m_cUnregisters);
 }
 
@@ -213,11 +213,11 @@ class CHostedServiceHolder
 {
 public:
     explicit CHostedServiceHolder(const wchar_t *wszDll)
-        : m_wstrName(scmtest::UniqueName(L"TelvaneTestHosted"))
-        , m_wstrGroup(scmtest::UniqueName(L"TelvaneTestGroup"))
+        : m_wstrName(testsupport::UniqueName(L"TelvaneTestHosted"))
+        , m_wstrGroup(testsupport::UniqueName(L"TelvaneTestGroup"))
         , m_cleanup(m_wstrName)
     {
-        m_fCreated = scmtest::CreateOwnProcess(m_wstrName.c_str(),
+        m_fCreated = testsupport::ServiceCreateOwnProcess(m_wstrName.c_str(),
                                                Quoted(testsupport::BinDir() + L"telvanehost.exe") +
                                                    L" -k " + m_wstrGroup);
         // Without the service, its key would stay behind with these values.
@@ -238,7 +238,7 @@ public:
 private:
     std::wstring m_wstrName;
     std::wstring m_wstrGroup;
-    scmtest::CServiceCleanup m_cleanup;
+    testsupport::CServiceCleanup m_cleanup;
     bool m_fCreated;
 };
 } // namespace
@@ -252,20 +252,20 @@ TEST(TelvaneHost, StopGoesThroughTheHostStopCallback)
     CReleaseOnExit release(hosted.Name());
     ASSERT_NE(nullptr, release.Get());
 
-    ASSERT_EQ(0u, scmtest::StartWithArgs(hosted.Name(), {L"hold-stop"}));
+    ASSERT_EQ(0u, testsupport::ServiceStart(hosted.Name(), {L"hold-stop"}));
     SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(scmtest::WaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
-    scmtest::CServiceProcess host(status.dwProcessId);
+    ASSERT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
+    testsupport::CServiceProcess host(status.dwProcessId);
     ASSERT_TRUE(host.Opened());
 
     SERVICE_STATUS statusControl = {};
-    EXPECT_EQ(0u, scmtest::Control(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
+    EXPECT_EQ(0u, testsupport::ServiceControl(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
-    ASSERT_TRUE(scmtest::QueryStatus(hosted.Name(), &status));
+    ASSERT_TRUE(testsupport::ServiceQueryStatus(hosted.Name(), &status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
 
     SetEvent(release.Get());
-    EXPECT_TRUE(scmtest::WaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
+    EXPECT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
     EXPECT_EQ(0u, host.WaitForExitCode(c_dwStateWaitMs));
 }
 
@@ -276,8 +276,8 @@ TEST(TelvaneHost, RegistrationWaitsUntilTheOldServiceIsGone)
     testsupport::FailureCapture failures;
     CHostedServiceHolder hosted(L"servicetest.dll");
     ASSERT_TRUE(hosted.Created());
-    ASSERT_EQ(0u, scmtest::StartWithArgs(hosted.Name(), {L"linger"}));
-    ASSERT_TRUE(scmtest::WaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs));
+    ASSERT_EQ(0u, testsupport::ServiceStart(hosted.Name(), {L"linger"}));
+    ASSERT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs));
 
     CTestService service(hosted.Name());
     service.m_idsLocalizedName = 1;
@@ -286,14 +286,14 @@ TEST(TelvaneHost, RegistrationWaitsUntilTheOldServiceIsGone)
     CService::RegisterService(&service);
     service.RegisterOneService();
     EXPECT_EQ(0u, failures.Count());
-    scmtest::SERVICE_RECORD record;
-    ASSERT_TRUE(scmtest::ReadRecord(hosted.Name(), &record));
+    testsupport::SERVICE_RECORD record;
+    ASSERT_TRUE(testsupport::ServiceReadRecord(hosted.Name(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_DEMAND_START), record.dwStartType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
 
     // Unregistering returns only once the name is free.
     service.UnregisterOneService();
-    EXPECT_FALSE(scmtest::ServiceExists(hosted.Name()));
+    EXPECT_FALSE(testsupport::ServiceExists(hosted.Name()));
     EXPECT_EQ(0u, failures.Count());
 }
 
@@ -305,10 +305,10 @@ TEST(TelvaneHost, TelvaneDllAnswersAnUnknownNameAtOnce)
     ASSERT_TRUE(hosted.Created());
     // Wine's StartService reports 1053 for a service that stops before it ran; Windows
     // reports success. Either way the status tells why.
-    DWORD dwStart = scmtest::StartWithArgs(hosted.Name(), {});
+    DWORD dwStart = testsupport::ServiceStart(hosted.Name(), {});
     EXPECT_TRUE(dwStart == ERROR_SUCCESS || dwStart == ERROR_SERVICE_REQUEST_TIMEOUT) << dwStart;
     SERVICE_STATUS_PROCESS status = {};
-    EXPECT_TRUE(scmtest::WaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
+    EXPECT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
     EXPECT_EQ(static_cast<DWORD>(ERROR_SERVICE_NOT_IN_EXE), status.dwWin32ExitCode);
 }
 

@@ -2,7 +2,7 @@
 // the test CA that the HTTPS fixture puts into the prefix's stores.
 #include "platform/endpointdirectory/endpointdirectory.h"
 #include "service/udptestpolicy.h"
-#include "tests/https/testpolicyserver.h"
+#include "tests/common/policyserver.h"
 #include "tests/udp/udptestsupport.h"
 
 #include <gtest/gtest.h>

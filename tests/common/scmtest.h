@@ -1,30 +1,30 @@
-// Helpers for the tests that go through the control manager of the test prefix: unique
-// names, bounded waits for a service state, and reading a service's record back.
+// The prefix's control manager: services created, started, controlled, read back and
+// removed with bounded waits, and the product installed as the README says (telvanerun -r,
+// the platform component registered) under either host. Used on the test thread.
 #pragma once
+
+#include "tests/common/testsupport.h"
 
 #include <windows.h>
 #include <string>
 #include <vector>
 
-namespace scmtest
+namespace testsupport
 {
-// "prefix_<pid>_<start>_<counter>": unique across processes running side by side.
-std::wstring UniqueName(const wchar_t *wszPrefix);
-
 // Polls the service until it reports the state; false (with the last status) on time-out.
-bool WaitForState(const wchar_t *wszService, DWORD dwState, DWORD dwTimeoutMs,
-                  SERVICE_STATUS_PROCESS *pStatus = nullptr);
-bool QueryStatus(const wchar_t *wszService, SERVICE_STATUS_PROCESS *pStatus);
+bool ServiceWaitForState(const wchar_t *wszService, DWORD dwState, DWORD dwTimeoutMs,
+                         SERVICE_STATUS_PROCESS *pStatus = nullptr);
+bool ServiceQueryStatus(const wchar_t *wszService, SERVICE_STATUS_PROCESS *pStatus);
 bool ServiceExists(const wchar_t *wszService);
 
 // Starts with the given start parameters; returns the error of StartService or 0.
-DWORD StartWithArgs(const wchar_t *wszService, const std::vector<std::wstring> &rgArgs);
+DWORD ServiceStart(const wchar_t *wszService, const std::vector<std::wstring> &rgArgs = {});
 // Sends a control; returns its error or 0 and fills *pStatus with what ControlService gave.
-DWORD Control(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatus);
+DWORD ServiceControl(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatus);
 // Sends STOP. A service whose handler stops it at once lets its process exit right away, and
 // Wine's control manager, reading the handler's answer after that, reports 109 although the
 // control was delivered: that counts as sent. Callers check the STOPPED state themselves.
-DWORD Stop(const wchar_t *wszService);
+DWORD ServiceStop(const wchar_t *wszService);
 
 struct SERVICE_RECORD
 {
@@ -36,15 +36,15 @@ struct SERVICE_RECORD
     std::wstring wstrStartName;
     std::wstring wstrDescription;
 };
-bool ReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord);
+bool ServiceReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord);
 
 // Creates an own-process service running wstrImagePath; false when CreateService failed.
-bool CreateOwnProcess(const wchar_t *wszService, const std::wstring &wstrImagePath);
-bool SetImagePath(const wchar_t *wszService, const std::wstring &wstrImagePath);
+bool ServiceCreateOwnProcess(const wchar_t *wszService, const std::wstring &wstrImagePath);
+bool ServiceSetImagePath(const wchar_t *wszService, const std::wstring &wstrImagePath);
 // Marks the service for deletion, leaving it as it runs; false when that failed.
-bool Delete(const wchar_t *wszService);
+bool ServiceDelete(const wchar_t *wszService);
 // Stops (bounded) and deletes the service if it exists.
-void StopAndDelete(const wchar_t *wszService);
+void ServiceStopAndDelete(const wchar_t *wszService);
 
 // Stops and deletes a test service when the test ends, however it ends.
 class CServiceCleanup
@@ -54,7 +54,7 @@ public:
         : m_wstrService(wstrService)
     {
     }
-    ~CServiceCleanup() { StopAndDelete(m_wstrService.c_str()); }
+    ~CServiceCleanup() { ServiceStopAndDelete(m_wstrService.c_str()); }
     CServiceCleanup(const CServiceCleanup &) = delete;
     CServiceCleanup &operator=(const CServiceCleanup &) = delete;
 
@@ -80,8 +80,21 @@ private:
     HANDLE m_hProcess;
 };
 
-// A REG_DWORD or string value under HKEY_LOCAL_MACHINE, read without the helpers under test.
-bool ReadDword(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdw);
-bool ReadRaw(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdwType,
-             std::wstring *pwstrData);
-} // namespace scmtest
+// The product under its real name, installed and removed with the README's own steps.
+extern const wchar_t c_wszTelvane[];
+enum class TelvaneHost
+{
+    Svchost,    // Wine's svchost.exe, as installed
+    TelvaneHost // telvanehost.exe -k OVTCBNetwork
+};
+// telvanerun.exe with these arguments.
+ChildResult RunTelvane(const std::wstring &wstrArguments);
+// telvanerun -r and regsvr32 of the platform component; the test fails when either fails.
+void TelvaneInstall(TelvaneHost host = TelvaneHost::Svchost);
+// telvanerun -u, the component unregistered, the service gone whatever state it was in.
+void TelvaneUninstall();
+// Starts the installed service and waits for RUNNING; its process id, or 0 (test failed).
+DWORD TelvaneStart();
+// Sends STOP and waits for STOPPED; false when it did not come.
+bool TelvaneStop();
+} // namespace testsupport

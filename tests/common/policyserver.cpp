@@ -1,4 +1,4 @@
-#include "tests/https/testpolicyserver.h"
+#include "tests/common/policyserver.h"
 
 #include <stdio.h>
 #include <fstream>

@@ -1,40 +1,19 @@
-#include "tests/service/scmtesthelpers.h"
+#include "tests/common/scmtest.h"
+#include "inc/handleholder.h"
 
+#include <gtest/gtest.h>
 #include <stdio.h>
 
-namespace scmtest
+namespace testsupport
 {
 namespace
 {
 const DWORD c_dwPollMs = 50;
 const DWORD c_dwStopTimeoutMs = 20000;
 
-// A control-manager handle closed on every way out.
-class CScHolder
+SC_HANDLE OpenTestService(const wchar_t *wszService, DWORD dwAccess)
 {
-public:
-    explicit CScHolder(SC_HANDLE h)
-        : m_h(h)
-    {
-    }
-    ~CScHolder()
-    {
-        if (m_h != nullptr)
-        {
-            CloseServiceHandle(m_h);
-        }
-    }
-    CScHolder(const CScHolder &) = delete;
-    CScHolder &operator=(const CScHolder &) = delete;
-    SC_HANDLE Get() const { return m_h; }
-
-private:
-    SC_HANDLE m_h;
-};
-
-SC_HANDLE OpenService(const wchar_t *wszService, DWORD dwAccess)
-{
-    CScHolder scm(OpenSCManagerW(nullptr, nullptr, SC_MANAGER_CONNECT));
+    CServiceHandle scm(OpenSCManagerW(nullptr, nullptr, SC_MANAGER_CONNECT));
     if (scm.Get() == nullptr)
     {
         return nullptr;
@@ -43,35 +22,24 @@ SC_HANDLE OpenService(const wchar_t *wszService, DWORD dwAccess)
 }
 } // namespace
 
-std::wstring UniqueName(const wchar_t *wszPrefix)
+bool ServiceQueryStatus(const wchar_t *wszService, SERVICE_STATUS_PROCESS *pStatus)
 {
-    // Wine hands out process ids again soon: the start time tells runs apart.
-    static LONG s_lCounter = 0;
-    static const ULONGLONG s_ullStart = GetTickCount64() % 1000000;
-    wchar_t wsz[128];
-    swprintf(wsz, 128, L"%ls_%lu_%llu_%ld", wszPrefix, GetCurrentProcessId(), s_ullStart,
-             InterlockedIncrement(&s_lCounter));
-    return wsz;
-}
-
-bool QueryStatus(const wchar_t *wszService, SERVICE_STATUS_PROCESS *pStatus)
-{
-    CScHolder service(OpenService(wszService, SERVICE_QUERY_STATUS));
+    CServiceHandle service(OpenTestService(wszService, SERVICE_QUERY_STATUS));
     DWORD cbNeeded = 0;
     return service.Get() != nullptr &&
            QueryServiceStatusEx(service.Get(), SC_STATUS_PROCESS_INFO,
                                 reinterpret_cast<BYTE *>(pStatus), sizeof(*pStatus), &cbNeeded);
 }
 
-bool WaitForState(const wchar_t *wszService, DWORD dwState, DWORD dwTimeoutMs,
-                  SERVICE_STATUS_PROCESS *pStatus)
+bool ServiceWaitForState(const wchar_t *wszService, DWORD dwState, DWORD dwTimeoutMs,
+                         SERVICE_STATUS_PROCESS *pStatus)
 {
     SERVICE_STATUS_PROCESS status = {};
     ULONGLONG ullDeadline = GetTickCount64() + dwTimeoutMs;
     bool fReached = false;
     for (;;)
     {
-        if (QueryStatus(wszService, &status) && status.dwCurrentState == dwState)
+        if (ServiceQueryStatus(wszService, &status) && status.dwCurrentState == dwState)
         {
             fReached = true;
             break;
@@ -91,13 +59,13 @@ bool WaitForState(const wchar_t *wszService, DWORD dwState, DWORD dwTimeoutMs,
 
 bool ServiceExists(const wchar_t *wszService)
 {
-    CScHolder service(OpenService(wszService, SERVICE_QUERY_STATUS));
+    CServiceHandle service(OpenTestService(wszService, SERVICE_QUERY_STATUS));
     return service.Get() != nullptr;
 }
 
-DWORD StartWithArgs(const wchar_t *wszService, const std::vector<std::wstring> &rgArgs)
+DWORD ServiceStart(const wchar_t *wszService, const std::vector<std::wstring> &rgArgs)
 {
-    CScHolder service(OpenService(wszService, SERVICE_START));
+    CServiceHandle service(OpenTestService(wszService, SERVICE_START));
     if (service.Get() == nullptr)
     {
         return GetLastError();
@@ -115,10 +83,10 @@ DWORD StartWithArgs(const wchar_t *wszService, const std::vector<std::wstring> &
     return ERROR_SUCCESS;
 }
 
-DWORD Control(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatus)
+DWORD ServiceControl(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatus)
 {
-    CScHolder service(
-        OpenService(wszService, SERVICE_STOP | SERVICE_INTERROGATE | SERVICE_USER_DEFINED_CONTROL));
+    CServiceHandle service(OpenTestService(wszService, SERVICE_STOP | SERVICE_INTERROGATE |
+                                                           SERVICE_USER_DEFINED_CONTROL));
     if (service.Get() == nullptr)
     {
         return GetLastError();
@@ -133,15 +101,15 @@ DWORD Control(const wchar_t *wszService, DWORD dwControl, SERVICE_STATUS *pStatu
     return dwError;
 }
 
-DWORD Stop(const wchar_t *wszService)
+DWORD ServiceStop(const wchar_t *wszService)
 {
-    DWORD dwError = Control(wszService, SERVICE_CONTROL_STOP, nullptr);
+    DWORD dwError = ServiceControl(wszService, SERVICE_CONTROL_STOP, nullptr);
     return dwError == ERROR_BROKEN_PIPE ? ERROR_SUCCESS : dwError;
 }
 
-bool ReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord)
+bool ServiceReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord)
 {
-    CScHolder service(OpenService(wszService, SERVICE_QUERY_CONFIG));
+    CServiceHandle service(OpenTestService(wszService, SERVICE_QUERY_CONFIG));
     if (service.Get() == nullptr)
     {
         return false;
@@ -175,45 +143,46 @@ bool ReadRecord(const wchar_t *wszService, SERVICE_RECORD *pRecord)
     return true;
 }
 
-bool CreateOwnProcess(const wchar_t *wszService, const std::wstring &wstrImagePath)
+bool ServiceCreateOwnProcess(const wchar_t *wszService, const std::wstring &wstrImagePath)
 {
-    CScHolder scm(OpenSCManagerW(nullptr, nullptr, SC_MANAGER_CREATE_SERVICE));
+    CServiceHandle scm(OpenSCManagerW(nullptr, nullptr, SC_MANAGER_CREATE_SERVICE));
     if (scm.Get() == nullptr)
     {
         return false;
     }
-    CScHolder service(CreateServiceW(scm.Get(), wszService, wszService, SERVICE_ALL_ACCESS,
-                                     SERVICE_WIN32_OWN_PROCESS, SERVICE_DEMAND_START,
-                                     SERVICE_ERROR_NORMAL, wstrImagePath.c_str(), nullptr, nullptr,
-                                     nullptr, nullptr, nullptr));
+    CServiceHandle service(CreateServiceW(scm.Get(), wszService, wszService, SERVICE_ALL_ACCESS,
+                                          SERVICE_WIN32_OWN_PROCESS, SERVICE_DEMAND_START,
+                                          SERVICE_ERROR_NORMAL, wstrImagePath.c_str(), nullptr,
+                                          nullptr, nullptr, nullptr, nullptr));
     return service.Get() != nullptr;
 }
 
-bool SetImagePath(const wchar_t *wszService, const std::wstring &wstrImagePath)
+bool ServiceSetImagePath(const wchar_t *wszService, const std::wstring &wstrImagePath)
 {
-    CScHolder service(OpenService(wszService, SERVICE_CHANGE_CONFIG));
+    CServiceHandle service(OpenTestService(wszService, SERVICE_CHANGE_CONFIG));
     return service.Get() != nullptr &&
            ChangeServiceConfigW(service.Get(), SERVICE_NO_CHANGE, SERVICE_NO_CHANGE,
                                 SERVICE_NO_CHANGE, wstrImagePath.c_str(), nullptr, nullptr, nullptr,
                                 nullptr, nullptr, nullptr);
 }
 
-bool Delete(const wchar_t *wszService)
+bool ServiceDelete(const wchar_t *wszService)
 {
-    CScHolder service(OpenService(wszService, DELETE));
+    CServiceHandle service(OpenTestService(wszService, DELETE));
     return service.Get() != nullptr && DeleteService(service.Get());
 }
 
-void StopAndDelete(const wchar_t *wszService)
+void ServiceStopAndDelete(const wchar_t *wszService)
 {
-    CScHolder service(OpenService(wszService, SERVICE_STOP | SERVICE_QUERY_STATUS | DELETE));
+    CServiceHandle service(
+        OpenTestService(wszService, SERVICE_STOP | SERVICE_QUERY_STATUS | DELETE));
     if (service.Get() == nullptr)
     {
         return;
     }
-    if (Stop(wszService) == ERROR_SUCCESS)
+    if (ServiceStop(wszService) == ERROR_SUCCESS)
     {
-        WaitForState(wszService, SERVICE_STOPPED, c_dwStopTimeoutMs);
+        ServiceWaitForState(wszService, SERVICE_STOPPED, c_dwStopTimeoutMs);
     }
     DeleteService(service.Get());
 }
@@ -252,34 +221,45 @@ DWORD CServiceProcess::WaitForExitCode(DWORD dwTimeoutMs) const
     return dwExitCode;
 }
 
-bool ReadDword(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdw)
+const wchar_t c_wszTelvane[] = L"Telvane";
+
+ChildResult RunTelvane(const std::wstring &wstrArguments)
 {
-    DWORD cb = sizeof(*pdw);
-    return RegGetValueW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), wszValue, RRF_RT_REG_DWORD, nullptr,
-                        pdw, &cb) == ERROR_SUCCESS;
+    return RunChild(BinCommand(L"telvanerun.exe") + L" " + wstrArguments);
 }
 
-bool ReadRaw(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD *pdwType,
-             std::wstring *pwstrData)
+void TelvaneInstall(TelvaneHost host)
 {
-    HKEY hKey = nullptr;
-    if (RegOpenKeyExW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), 0, KEY_READ, &hKey) != ERROR_SUCCESS)
+    ChildResult installed = RunTelvane(L"-r");
+    ASSERT_EQ(0u, installed.dwExitCode) << installed.strOutput;
+    ChildResult registered = RunChild(L"regsvr32 /s " + BinCommand(L"platformcomponent.dll"));
+    ASSERT_EQ(0u, registered.dwExitCode) << registered.strOutput;
+    if (host == TelvaneHost::TelvaneHost)
     {
-        return false;
+        ASSERT_TRUE(ServiceSetImagePath(c_wszTelvane,
+                                        BinCommand(L"telvanehost.exe") + L" -k OVTCBNetwork"));
     }
-    DWORD cb = 0;
-    LONG lStatus = RegQueryValueExW(hKey, wszValue, nullptr, pdwType, nullptr, &cb);
-    std::vector<BYTE> rgb(cb + sizeof(wchar_t));
-    if (lStatus == ERROR_SUCCESS)
-    {
-        lStatus = RegQueryValueExW(hKey, wszValue, nullptr, pdwType, rgb.data(), &cb);
-    }
-    RegCloseKey(hKey);
-    if (lStatus != ERROR_SUCCESS)
-    {
-        return false;
-    }
-    pwstrData->assign(reinterpret_cast<const wchar_t *>(rgb.data()), cb / sizeof(wchar_t));
-    return true;
 }
-} // namespace scmtest
+
+void TelvaneUninstall()
+{
+    RunTelvane(L"-u");
+    RunChild(L"regsvr32 /s /u " + BinCommand(L"platformcomponent.dll"));
+    ServiceStopAndDelete(c_wszTelvane);
+}
+
+DWORD TelvaneStart()
+{
+    EXPECT_EQ(0u, ServiceStart(c_wszTelvane));
+    SERVICE_STATUS_PROCESS status = {};
+    bool fRunning = ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, 2 * c_dwWaitMs, &status);
+    EXPECT_TRUE(fRunning) << status.dwCurrentState << " " << status.dwWin32ExitCode;
+    return fRunning ? status.dwProcessId : 0;
+}
+
+bool TelvaneStop()
+{
+    EXPECT_EQ(0u, ServiceStop(c_wszTelvane));
+    return ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, 2 * c_dwWaitMs);
+}
+} // namespace testsupport
