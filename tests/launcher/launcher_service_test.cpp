@@ -97,7 +97,7 @@ TEST_F(LauncherServiceTest, BacklightChangeRunsTestAgainstRelay)
     PolicyFile policy;
     policy.strRelayPort = std::to_string(usPort);
     WritePolicyFile(policy);
-    udptest::RelayProcess relay(usPort, L"-packets 20");
+    testsupport::CRelayProcess relay(usPort, L"-packets 20");
     ASSERT_TRUE(relay.Listening());
     DWORD cLaunches = ChamberLaunchCount();
     StartService();
@@ -113,9 +113,9 @@ TEST_F(LauncherServiceTest, BacklightChangeRunsTestAgainstRelay)
     EXPECT_TRUE(m_pTrace->Contains(c_szLoadingConfig));
 
     EXPECT_EQ("received 20 echoed 20 end packets\n", relay.WaitForReport());
-    ASSERT_TRUE(WaitUntil([] { return !udptest::ResultFiles().empty(); }));
+    ASSERT_TRUE(WaitUntil([] { return !testsupport::ResultFiles().empty(); }));
     std::string strResult;
-    ASSERT_TRUE(udptest::ReadWholeFile(udptest::ResultFiles()[0], &strResult));
+    ASSERT_TRUE(udptest::ReadWholeFile(testsupport::ResultFiles()[0], &strResult));
     EXPECT_NE(std::string::npos, strResult.find("\"Received\":20")) << strResult;
 
     // The start is remembered in the saved policy, with the rest of it unchanged.
@@ -191,7 +191,7 @@ TEST_F(LauncherServiceTest, ChangeWhileTestRunsIsIgnored)
             // A folder where the new policy would be written makes every save fail.
             ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr));
         }
-        udptest::RelayProcess relay(usPort, L"-packets 150");
+        testsupport::CRelayProcess relay(usPort, L"-packets 150");
         ASSERT_TRUE(relay.Listening());
         DWORD cLaunches = ChamberLaunchCount();
         StartService();
@@ -200,7 +200,7 @@ TEST_F(LauncherServiceTest, ChangeWhileTestRunsIsIgnored)
         ASSERT_TRUE(WaitForLine(*m_pTrace, c_szLaunched));
         EXPECT_EQ(c.fSaveFails, m_pTrace->Contains("2001|CreateFile (write)|80070005"))
             << "the failed save is traced";
-        ASSERT_TRUE(udptest::ResultFiles().empty()) << "the test ended before the next change";
+        ASSERT_TRUE(testsupport::ResultFiles().empty()) << "the test ended before the next change";
         ToggleBacklight(0);
         ToggleBacklight(2);
         EXPECT_EQ(2u, CountLines(*m_pTrace, c_szStillRunning));
@@ -209,7 +209,7 @@ TEST_F(LauncherServiceTest, ChangeWhileTestRunsIsIgnored)
         EXPECT_EQ("received 150 echoed 150 end packets\n", relay.WaitForReport());
         StopService();
         EXPECT_EQ(cLaunches + 1, ChamberLaunchCount());
-        EXPECT_EQ(1u, udptest::ResultFiles().size());
+        EXPECT_EQ(1u, testsupport::ResultFiles().size());
         usPort++;
     }
 }
@@ -222,16 +222,16 @@ TEST_F(LauncherServiceTest, StopWhileTestRunsCompletesAfterTestExits)
     policy.strRelayPort = std::to_string(usPort);
     policy.strNumPackets = "250"; // five seconds of sending
     WritePolicyFile(policy);
-    udptest::RelayProcess relay(usPort, L"-packets 250");
+    testsupport::CRelayProcess relay(usPort, L"-packets 250");
     ASSERT_TRUE(relay.Listening());
     StartService();
 
     ToggleBacklight(0);
     ASSERT_TRUE(WaitForLine(*m_pTrace, c_szLaunched));
-    ASSERT_TRUE(udptest::ResultFiles().empty()) << "the test ended before the stop";
+    ASSERT_TRUE(testsupport::ResultFiles().empty()) << "the test ended before the stop";
     StopService();
     // The application writes its result as it ends: the stop came back only after that.
-    EXPECT_EQ(1u, udptest::ResultFiles().size());
+    EXPECT_EQ(1u, testsupport::ResultFiles().size());
     EXPECT_TRUE(m_pTrace->Contains(c_szStillWaiting));
     EXPECT_TRUE(m_pTrace->Contains(c_szFinishedDestruction));
     EXPECT_EQ("received 250 echoed 250 end packets\n", relay.WaitForReport());
@@ -263,7 +263,7 @@ TEST_F(LauncherServiceTest, ExpiredPolicyIsRefreshedFromWebService)
                               REG_SZ, wstrEndpoint.c_str(),
                               static_cast<DWORD>((wstrEndpoint.size() + 1) * sizeof(wchar_t))));
     PublishPowerSource(1); // the answer allows battery power
-    udptest::RelayProcess relay(usRelayPort, L"-packets 10");
+    testsupport::CRelayProcess relay(usRelayPort, L"-packets 10");
     ASSERT_TRUE(relay.Listening());
     StartService();
 

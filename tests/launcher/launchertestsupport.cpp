@@ -87,8 +87,8 @@ void PreparePrefix()
 {
     testsupport::ChildResult result = testsupport::RunChild(ComponentCommand(L"/s"));
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    udptest::InstallTestApplication();
-    udptest::PreparePolicyFolder();
+    testsupport::InstallTestApplication();
+    testsupport::PreparePolicyFolder();
     // No web service: a refresh fails at once at the endpoint directory.
     RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     ASSERT_HRESULT_SUCCEEDED(WiFiStandInSetConnected(L"127.0.0.1"));
@@ -105,7 +105,7 @@ void CleanupPrefix()
     WiFiStandInSetDisconnected();
     ChamberStandInSetFailure(nullptr, S_OK);
     RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
-    udptest::PreparePolicyFolder();
+    testsupport::PreparePolicyFolder();
     // Whatever subscribes next (a service the prefix starts) finds nothing to do.
     PublishBacklight(1);
 }

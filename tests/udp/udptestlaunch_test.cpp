@@ -19,8 +19,8 @@ class UdpTestLaunch : public ::testing::Test
 protected:
     void SetUp() override
     {
-        udptest::PreparePolicyFolder();
-        udptest::InstallTestApplication();
+        testsupport::PreparePolicyFolder();
+        testsupport::InstallTestApplication();
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
     void TearDown() override
@@ -107,7 +107,7 @@ TEST_F(UdpTestLaunch, WiFiGate)
 
 TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
 {
-    udptest::RelayProcess relay(47215);
+    testsupport::CRelayProcess relay(47215);
     ASSERT_TRUE(relay.Listening());
     UdpTestConfig config = RelayConfig(47215);
     TraceSession session;
@@ -126,7 +126,7 @@ TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
     ASSERT_TRUE(udptest::ReadWholeFile(c_wszUdpConfigFile, &strSaved));
     EXPECT_NE(std::string::npos, strSaved.find("\"LastTest\":" + std::to_string(config.lastTest)));
     EXPECT_EQ("received 10 echoed 10 end idle\n", relay.WaitForReport());
-    EXPECT_EQ(1u, udptest::ResultFiles().size());
+    EXPECT_EQ(1u, testsupport::ResultFiles().size());
 }
 
 TEST_F(UdpTestLaunch, ChamberFailuresStartNothing)

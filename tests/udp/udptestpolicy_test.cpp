@@ -17,7 +17,7 @@ const char c_szResetText[] = R"({"Enabled":false,"RelayFQDN":"","RelayPort":0,"E
 class UdpTestPolicy : public ::testing::Test
 {
 protected:
-    void SetUp() override { udptest::PreparePolicyFolder(); }
+    void SetUp() override { testsupport::PreparePolicyFolder(); }
     void TearDown() override
     {
         RemoveDirectoryW(c_wszUdpConfigTempFile);

@@ -100,7 +100,7 @@ std::string WithoutExpiration(const std::string &strText, uint64_t *pullExpirati
 class UdpTestRefresh : public ::testing::Test
 {
 protected:
-    void SetUp() override { udptest::PreparePolicyFolder(); }
+    void SetUp() override { testsupport::PreparePolicyFolder(); }
     void TearDown() override
     {
         DeleteFileW(c_wszUdpConfigFile);

@@ -11,7 +11,7 @@
 #include <memory>
 #include <sddl.h>
 
-using udptest::RelayProcess;
+using testsupport::CRelayProcess;
 
 namespace
 {
@@ -54,7 +54,7 @@ HRESULT StartInChamber(const std::string &strArguments, PROCESS_INFORMATION *ppi
                        std::wstring *pwstrSid, std::wstring *pwstrCommandLine)
 {
     wchar_t wszCommandLine[256];
-    swprintf_s(wszCommandLine, L"%s %hs", udptest::c_wszTestAppPath, strArguments.c_str());
+    swprintf_s(wszCommandLine, L"%s %hs", testsupport::c_wszTestAppPath, strArguments.c_str());
     *pwstrCommandLine = wszCommandLine;
     PSID pSid = nullptr;
     HRESULT hr = GetChamberSidFromId(c_wszChamberId, &pSid);
@@ -101,7 +101,7 @@ void RunAndCollect(const std::string &strArguments, RunSummary *pSummary)
     EXPECT_EQ(wstrCommandLine, ReadChamberString(L"LastCommandLine"));
     EXPECT_EQ(pi.dwProcessId, ReadChamberDword(L"LastProcessId"));
 
-    std::vector<std::wstring> rgFiles = udptest::ResultFiles();
+    std::vector<std::wstring> rgFiles = testsupport::ResultFiles();
     ASSERT_EQ(1u, rgFiles.size());
     ASSERT_TRUE(udptest::ReadWholeFile(rgFiles[0], &pSummary->strResult));
     std::unique_ptr<JsonValue> pRoot(JsonReader::FromJsonString(pSummary->strResult.c_str()));
@@ -118,7 +118,7 @@ class ZoRiVirOruz : public ::testing::Test
 protected:
     void SetUp() override
     {
-        udptest::InstallTestApplication();
+        testsupport::InstallTestApplication();
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
     void TearDown() override { RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY); }
@@ -128,7 +128,7 @@ protected:
 TEST_F(ZoRiVirOruz, CountsEchoesFromTheRelay)
 {
     // The relay leaves every fourth packet unanswered, so the count shows what came back.
-    RelayProcess relay(47211, L"-drop 4");
+    CRelayProcess relay(47211, L"-drop 4");
     ASSERT_TRUE(relay.Listening());
     UdpTestConfig config;
     ResetUdpConfig(&config);
@@ -189,10 +189,10 @@ TEST_F(ZoRiVirOruz, BadArguments)
     {
         SCOPED_TRACE(testsupport::Narrow(wszArguments));
         testsupport::ChildResult result = testsupport::RunChild(
-            std::wstring(udptest::c_wszTestAppPath) + L" " + wszArguments, {}, 30000);
+            std::wstring(testsupport::c_wszTestAppPath) + L" " + wszArguments, {}, 30000);
         EXPECT_EQ(2u, result.dwExitCode) << result.strOutput;
     }
-    EXPECT_TRUE(udptest::ResultFiles().empty()); // a refused command line measures nothing
+    EXPECT_TRUE(testsupport::ResultFiles().empty()); // a refused command line measures nothing
 }
 
 TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
@@ -201,17 +201,18 @@ TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
     for (int i = 0; i < 70; i++)
     {
         wchar_t wszName[MAX_PATH];
-        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json", udptest::c_wszResultFolder,
-                   i);
+        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json",
+                   testsupport::c_wszResultFolder, i);
         ASSERT_TRUE(udptest::WriteWholeFile(wszName, "{}"));
     }
     testsupport::ChildResult result = testsupport::RunChild(
-        std::wstring(udptest::c_wszTestAppPath) + L" -count 0 127.0.0.1 47214", {}, 60000);
+        std::wstring(testsupport::c_wszTestAppPath) + L" -count 0 127.0.0.1 47214", {}, 60000);
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
-    std::vector<std::wstring> rgFiles = udptest::ResultFiles();
+    std::vector<std::wstring> rgFiles = testsupport::ResultFiles();
     EXPECT_EQ(64u, rgFiles.size());
     std::sort(rgFiles.begin(), rgFiles.end());
-    EXPECT_EQ(std::wstring(udptest::c_wszResultFolder) + L"\\result-20200101T000007.000Z-1.json",
+    EXPECT_EQ(std::wstring(testsupport::c_wszResultFolder) +
+                  L"\\result-20200101T000007.000Z-1.json",
               rgFiles.front());
     EXPECT_EQ(std::wstring::npos, rgFiles.back().find(L"result-2020")); // the new run
 }

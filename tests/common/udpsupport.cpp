@@ -1,0 +1,112 @@
+#include "tests/common/udpsupport.h"
+#include "service/udptestpolicy.h"
+#include "tests/common/testsupport.h"
+
+#include <gtest/gtest.h>
+
+namespace testsupport
+{
+void PreparePolicyFolder()
+{
+    CreateDirectoryW(L"C:\\data", nullptr);
+    CreateDirectoryW(L"C:\\data\\shareddata", nullptr);
+    CreateDirectoryW(L"C:\\data\\shareddata\\zoriviroruz", nullptr);
+    DeleteFileW(c_wszUdpConfigFile);
+    RemoveDirectoryW(c_wszUdpConfigTempFile); // a test may have left a folder in its place
+    DeleteFileW(c_wszUdpConfigTempFile);
+    ASSERT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigFile));
+}
+
+const wchar_t c_wszTestAppPath[] = L"C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe";
+const wchar_t c_wszResultFolder[] = L"C:\\data\\shareddata\\zoriviroruz\\results";
+
+void InstallTestApplication()
+{
+    CreateDirectoryW(L"C:\\programs", nullptr);
+    CreateDirectoryW(L"C:\\programs\\zoriviroruz", nullptr);
+    CreateDirectoryW(L"C:\\data", nullptr);
+    CreateDirectoryW(L"C:\\data\\shareddata", nullptr);
+    CreateDirectoryW(L"C:\\data\\shareddata\\zoriviroruz", nullptr);
+    std::wstring wstrBuilt = BinDir() + L"ZoRiVirOruz.exe";
+    ASSERT_TRUE(CopyFileW(wstrBuilt.c_str(), c_wszTestAppPath, FALSE)) << GetLastError();
+    for (const std::wstring &wstrFile : ResultFiles())
+    {
+        DeleteFileW(wstrFile.c_str());
+    }
+}
+
+std::vector<std::wstring> ResultFiles()
+{
+    std::vector<std::wstring> rgFiles;
+    WIN32_FIND_DATAW data;
+    std::wstring wstrPattern = std::wstring(c_wszResultFolder) + L"\\*.json";
+    HANDLE hFind = FindFirstFileW(wstrPattern.c_str(), &data);
+    if (hFind == INVALID_HANDLE_VALUE)
+    {
+        return rgFiles;
+    }
+    do
+    {
+        rgFiles.push_back(std::wstring(c_wszResultFolder) + L"\\" + data.cFileName);
+    } while (FindNextFileW(hFind, &data));
+    FindClose(hFind);
+    return rgFiles;
+}
+
+CRelayProcess::CRelayProcess(unsigned short usPort, const std::wstring &wstrExtraArguments)
+{
+    wchar_t wszEvent[64];
+    swprintf_s(wszEvent, L"TelvaneRelayReady-%lu-%u", GetCurrentProcessId(), usPort);
+    HANDLE hReady = CreateEventW(nullptr, TRUE, FALSE, wszEvent);
+    if (hReady == nullptr)
+    {
+        ADD_FAILURE() << "CreateEvent " << GetLastError();
+        return;
+    }
+    wchar_t wszReport[MAX_PATH];
+    DWORD cch = GetTempPathW(MAX_PATH, wszReport);
+    swprintf_s(wszReport + cch, MAX_PATH - cch, L"relay-%lu-%u.txt", GetCurrentProcessId(), usPort);
+    m_wstrReport = wszReport;
+    DeleteFileW(m_wstrReport.c_str());
+    std::wstring wstrCommand = L"\"" + BinDir() + L"udprelay.exe\" -port " +
+                               std::to_wstring(usPort) + L" -idle 3 -lifetime 120 -ready " +
+                               wszEvent + L" -report \"" + m_wstrReport + L"\" " +
+                               wstrExtraArguments;
+    STARTUPINFOW si = {sizeof(si)};
+    PROCESS_INFORMATION pi = {};
+    if (!CreateProcessW(nullptr, &wstrCommand[0], nullptr, nullptr, FALSE, CREATE_NO_WINDOW,
+                        nullptr, nullptr, &si, &pi))
+    {
+        ADD_FAILURE() << "CreateProcess " << GetLastError();
+        CloseHandle(hReady);
+        return;
+    }
+    CloseHandle(pi.hThread);
+    m_hProcess = pi.hProcess;
+    HANDLE rgh[] = {hReady, m_hProcess};
+    m_fListening = WaitForMultipleObjects(2, rgh, FALSE, 30000) == WAIT_OBJECT_0;
+    CloseHandle(hReady);
+}
+
+CRelayProcess::~CRelayProcess()
+{
+    if (m_hProcess != nullptr)
+    {
+        // The relay ends by itself once idle; a test that failed early still waits for it.
+        WaitForSingleObject(m_hProcess, 30000);
+        CloseHandle(m_hProcess);
+    }
+    DeleteFileW(m_wstrReport.c_str());
+}
+
+std::string CRelayProcess::WaitForReport()
+{
+    std::string strReport;
+    if (m_hProcess == nullptr || WaitForSingleObject(m_hProcess, 60000) != WAIT_OBJECT_0)
+    {
+        return strReport;
+    }
+    ReadFileText(m_wstrReport, &strReport);
+    return strReport;
+}
+} // namespace testsupport
