@@ -10,6 +10,7 @@ namespace
 {
 const wchar_t c_wszRole[] = L"TelvaneTestRole";
 
+// Removes the test's role after each test; runs on the test's main thread.
 class EndpointDirectoryTest : public ::testing::Test
 {
 protected:

@@ -15,6 +15,7 @@ DWORD Ctl(const wchar_t *wszArgs)
     return testsupport::RunTelvanectl(std::wstring(L"platform ") + wszArgs).dwExitCode;
 }
 
+// Puts the stand-ins' steering values back after each test; runs on the main thread.
 class PlatformCtlTest : public ::testing::Test
 {
 protected:

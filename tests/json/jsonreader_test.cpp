@@ -137,6 +137,8 @@ TEST(JsonReader, ChoicesWhereTheRulesLeaveAGap)
     EXPECT_EQ("[1]", Text(*Read("[1}")));
     EXPECT_EQ("{\"a\":[1],\"b\":2}", Text(*Read("{\"a\":[1},\"b\":2}")));
     EXPECT_EQ("[[]]", Text(*Read("[[}]")));
+    // A comma and white space before the close add no element.
+    EXPECT_EQ("[1]", Text(*Read("[1, ]")));
 
     // A name part shorter than two bytes gives an empty name; two bytes are both dropped.
     EXPECT_EQ("{\"\":1}", Text(*Read("{a:1}")));
