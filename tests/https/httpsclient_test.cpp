@@ -469,45 +469,6 @@ TEST_F(HttpsClientTest, NullArgumentsAreRefused)
     EXPECT_TRUE(Ids().empty());
 }
 
-// Where the completion leaves the outcome; the completion runs on a WinHTTP thread.
-struct CompletionOutcome
-{
-    LONG cCalls = 0;
-    HRESULT hr = E_PENDING;
-    JsonValue *pRoot = nullptr;
-    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
-    ~CompletionOutcome() { CloseHandle(hDone); }
-
-    static void Complete(void *pv, HRESULT hr, JsonValue *pRoot)
-    {
-        CompletionOutcome *p = static_cast<CompletionOutcome *>(pv);
-        InterlockedIncrement(&p->cCalls);
-        p->hr = hr;
-        p->pRoot = pRoot;
-        SetEvent(p->hDone);
-    }
-};
-
-// The provider is registered while a context lives and unregistered with the last one.
-TEST_F(HttpsClientTest, ProviderLivesWithTheContexts)
-{
-    EXPECT_EQ(0u, g_OrvexJsonTraceProvider.hRegistration);
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(ServerOn(47130)));
-
-    CompletionOutcome outcome;
-    JsonRequest request = Request(CTestPolicyServer::Url(47130));
-    JsonRequestContext *pContext = nullptr;
-    ASSERT_EQ(S_OK, OrvexJsonSend(&request, CompletionOutcome::Complete, &outcome, &pContext));
-    EXPECT_NE(0u, g_OrvexJsonTraceProvider.hRegistration);
-    EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(outcome.hDone, INFINITE));
-    EXPECT_EQ(S_OK, outcome.hr);
-    EXPECT_EQ("true", MemberText(outcome.pRoot, "Enabled"));
-    delete outcome.pRoot;
-    EXPECT_EQ(S_OK, OrvexJsonClose(pContext));
-    EXPECT_EQ(0u, g_OrvexJsonTraceProvider.hRegistration);
-}
-
 // A trace session's level and keywords decide which events are written, by their class:
 // error (19), information (12, 24) and verbose (27, 15, 99, 26). A 404 and then an object.
 TEST_F(HttpsClientTest, WritesOnlyWhatTheSessionEnabled)
@@ -575,7 +536,7 @@ TEST_F(HttpsClientTest, TraceStdoutEchoesTheClientsEvents)
 // Wine never reports a secure failure, so this case hands the status callback the
 // notification itself, while the real request waits on a listener that never answers its
 // handshake. The completion runs once, with E_ACCESSDENIED; the real failure that follows
-// calls nothing more.
+// calls nothing more. The client's provider is registered only while the context lives.
 TEST_F(HttpsClientTest, SecureFailureCompletesOnce)
 {
     WSADATA wsa;
@@ -589,10 +550,25 @@ TEST_F(HttpsClientTest, SecureFailureCompletesOnce)
     ASSERT_EQ(0, bind(listener, reinterpret_cast<sockaddr *>(&address), sizeof(address)));
     ASSERT_EQ(0, listen(listener, 4));
 
-    CompletionOutcome outcome;
+    // Filled in on a WinHTTP thread; the test reads it once the event is set.
+    struct Outcome
+    {
+        LONG cCalls = 0;
+        HRESULT hr = S_OK;
+        HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    } outcome;
+    auto complete = [](void *pv, HRESULT hr, JsonValue *pRoot) {
+        Outcome *p = static_cast<Outcome *>(pv);
+        InterlockedIncrement(&p->cCalls);
+        p->hr = hr;
+        delete pRoot;
+        SetEvent(p->hDone);
+    };
     JsonRequest request = Request(CTestPolicyServer::Url(47142));
     JsonRequestContext *pContext = nullptr;
-    ASSERT_EQ(S_OK, OrvexJsonSend(&request, CompletionOutcome::Complete, &outcome, &pContext));
+    EXPECT_EQ(0u, g_OrvexJsonTraceProvider.hRegistration);
+    ASSERT_EQ(S_OK, OrvexJsonSend(&request, complete, &outcome, &pContext));
+    EXPECT_NE(0u, g_OrvexJsonTraceProvider.hRegistration);
 
     DWORD dwFlags = WINHTTP_CALLBACK_STATUS_FLAG_INVALID_CA;
     OrvexJsonStatusCallback(nullptr, 0, WINHTTP_CALLBACK_STATUS_SECURE_FAILURE, &dwFlags,
@@ -610,9 +586,11 @@ TEST_F(HttpsClientTest, SecureFailureCompletesOnce)
     // and its request error finds the completion already taken.
     closesocket(listener);
     EXPECT_EQ(S_OK, OrvexJsonClose(pContext));
+    EXPECT_EQ(0u, g_OrvexJsonTraceProvider.hRegistration);
     EXPECT_EQ(1, outcome.cCalls);
     EXPECT_EQ(c_hrAccessDenied, outcome.hr);
     EXPECT_TRUE(Find(22)); // the real failure came, and called nothing
     WSACleanup();
+    CloseHandle(outcome.hDone);
 }
 } // namespace
