@@ -93,28 +93,39 @@ TEST(Assert, CheckReportsOnlyFalseConditions)
     EXPECT_TRUE(log.Contains(L"): Assertion failure: cValue == 2\r\n"));
 }
 
-TEST(DebugLog, QuietProcessPrintsFailureReportsButNoDebugLines)
+// A fatal error or a failed assertion ends the process with its report; a quiet process (a
+// benchmark's) prints the reports and its own output, but no debug lines.
+TEST(FailFast, FatalErrorAndAssertEndTheProcessQuietOrNot)
 {
-    const std::wstring child = L"\"" + testsupport::BinDir() + L"foundation_child.exe\" quiet ";
     struct Case
     {
-        const wchar_t *wszMode;
+        const wchar_t *wszArgs;
         DWORD dwExitCode;
         const char *szOutputPart;
     };
     const Case rgCases[] = {
-        {L"figures", 0, "figure 42\n"},
-        {L"fatal", 0xC0000602u, "): Fatal error 0x5 from CreateThing: "},
+        {L"fatal", 0xC0000602u, "tests/foundation/foundation_child.cpp("},
         {L"assert", 0xC0000602u, "Assertion failure: cItems == 3\r\n"},
+        {L"quiet fatal", 0xC0000602u, "): Fatal error 0x5 from CreateThing: "},
+        {L"quiet assert", 0xC0000602u, "Assertion failure: cItems == 3\r\n"},
+        {L"quiet figures", 0, "figure 42\n"}, // and nothing else
     };
     for (const Case &c : rgCases)
     {
-        testsupport::ChildResult result = testsupport::RunChild(child + c.wszMode);
-        EXPECT_EQ(c.dwExitCode, result.dwExitCode) << testsupport::Narrow(c.wszMode);
+        SCOPED_TRACE(testsupport::Narrow(c.wszArgs));
+        testsupport::ChildResult result = testsupport::RunChild(
+            testsupport::BinCommand(L"foundation_child.exe") + L" " + c.wszArgs);
+        EXPECT_FALSE(result.fTimedOut);
+        EXPECT_EQ(c.dwExitCode, result.dwExitCode);
         EXPECT_NE(std::string::npos, result.strOutput.find(c.szOutputPart)) << result.strOutput;
         EXPECT_EQ(std::string::npos, result.strOutput.find("nobody sees")) << result.strOutput;
+        // Reports name the source relative to the tree, never by the build machine's path.
+        EXPECT_EQ(std::string::npos, result.strOutput.find(": /")) << result.strOutput;
+        if (c.dwExitCode == 0)
+        {
+            EXPECT_EQ(c.szOutputPart, result.strOutput);
+        }
     }
-    EXPECT_EQ("figure 42\n", testsupport::RunChild(child + L"figures").strOutput);
 }
 
 TEST(DebugLog, QuietLinesStillReachTheLogHook)
@@ -124,23 +135,4 @@ TEST(DebugLog, QuietLinesStillReachTheLogHook)
     DebugLog(L"Tests::Quiet", L"%s\r\n", L"seen by the hook");
     DiagnosticsSetLogQuiet(false);
     EXPECT_TRUE(log.Contains(L"Tests::Quiet: seen by the hook\r\n"));
-}
-
-TEST(FailFast, FatalErrorAndAssertEndTheProcess)
-{
-    const std::wstring child = L"\"" + testsupport::BinDir() + L"foundation_child.exe\"";
-
-    testsupport::ChildResult fatal = testsupport::RunChild(child + L" fatal");
-    EXPECT_FALSE(fatal.fTimedOut);
-    EXPECT_EQ(0xC0000602u, fatal.dwExitCode);
-    EXPECT_NE(std::string::npos,
-              fatal.strOutput.find("ChildMain: tests/foundation/foundation_child.cpp("))
-        << fatal.strOutput;
-    EXPECT_NE(std::string::npos, fatal.strOutput.find("): Fatal error 0x5 from CreateThing: "))
-        << fatal.strOutput;
-
-    testsupport::ChildResult assertion = testsupport::RunChild(child + L" assert");
-    EXPECT_EQ(0xC0000602u, assertion.dwExitCode);
-    EXPECT_NE(std::string::npos, assertion.strOutput.find("Assertion failure: cItems == 3\r\n"))
-        << assertion.strOutput;
 }

@@ -33,7 +33,8 @@ void CaptureWrite(REGHANDLE, const EVENT_DESCRIPTOR *pDescriptor, ULONG cData,
     s_rgEvents.push_back(event);
 }
 
-// Captures written events and acts as a trace session on the main provider.
+// Captures written events and acts as a trace session on the main provider; the events are
+// written on the test's main thread, which owns the capture.
 class EventTraceTest : public ::testing::Test
 {
 protected:

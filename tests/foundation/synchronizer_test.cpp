@@ -66,7 +66,8 @@ enum : ULONG
     EventDropCreator = 4,
 };
 
-// Records what its handlers saw; reference counted like the service's objects.
+// Records what its handlers saw; reference counted like the service's objects. Its handlers
+// run on whichever test thread posts; the test that creates it owns the creator's reference.
 class CRecorder : public SynchronizedObject
 {
 public:
@@ -82,10 +83,7 @@ public:
         }
     }
 
-    void Send(ULONG ulType, ULONG_PTR a1 = 0, ULONG_PTR a2 = 0, ULONG_PTR a3 = 0)
-    {
-        Post(ulType, a1, a2, a3);
-    }
+    using SynchronizedObject::Post;
 
     void *SynchronizerAddress() const { return m_pSynchronizer; }
 
@@ -111,12 +109,11 @@ public:
             {
                 Post(EventRecord, 0, i);
             }
-            m_fPostedThree = true;
             break;
         case EventPostToOther: {
             m_rgRecords.push_back({0, 0, GetCurrentThreadId(), m_cDepth});
             CRecorder *pOther = reinterpret_cast<CRecorder *>(ulArg1);
-            pOther->Send(EventRecord, 9, 9);
+            pOther->Post(EventRecord, 9, 9);
             m_cOtherRecordsAfterPost = pOther->m_rgRecords.size();
             break;
         }
@@ -155,7 +152,6 @@ public:
     std::atomic<bool> m_fInside{false};
     std::atomic<int> m_cOverlaps{0};
     int m_cDepth = 0;
-    bool m_fPostedThree = false;
     size_t m_cOtherRecordsAfterPost = 0;
 
 private:
@@ -179,7 +175,7 @@ TEST(Synchronizer, ConcurrentPostersNeverOverlapAndKeepTheirOrder)
             }
             for (ULONG_PTR i = 0; i < cPerThread; i++)
             {
-                pObject->Send(EventRecord, t, i, i % 64 == 0);
+                pObject->Post(EventRecord, t, i, i % 64 == 0);
             }
         });
     }
@@ -205,7 +201,7 @@ TEST(Synchronizer, ConcurrentPostersNeverOverlapAndKeepTheirOrder)
 TEST(Synchronizer, PostsToSelfRunAfterTheHandlerInOrderOnTheSameThread)
 {
     CRecorder *pObject = new CRecorder();
-    pObject->Send(EventPostThreeToSelf);
+    pObject->Post(EventPostThreeToSelf);
     // All three ran before the outermost Post returned, after the posting handler, unnested.
     ASSERT_EQ(4u, pObject->m_rgRecords.size());
     for (ULONG_PTR i = 0; i < 4; i++)
@@ -221,7 +217,7 @@ TEST(Synchronizer, PostToAnotherIdleObjectRunsNested)
 {
     CRecorder *pFirst = new CRecorder();
     CRecorder *pSecond = new CRecorder();
-    pFirst->Send(EventPostToOther, reinterpret_cast<ULONG_PTR>(pSecond));
+    pFirst->Post(EventPostToOther, reinterpret_cast<ULONG_PTR>(pSecond));
     // The other object's handler had run by the time its Post returned inside ours.
     EXPECT_EQ(1u, pFirst->m_cOtherRecordsAfterPost);
     ASSERT_EQ(1u, pSecond->m_rgRecords.size());
@@ -239,14 +235,14 @@ TEST(Synchronizer, ObjectDeletedByTheReleaseAfterItsLastEvent)
     WatchDelete(pObject->SynchronizerAddress());
     // The handler drops the creator's reference; the Post's own release then deletes the
     // object inside the dispatch loop, which must delete the Synchronizer after draining.
-    pObject->Send(EventDropCreator);
+    pObject->Post(EventDropCreator);
     EXPECT_TRUE(fDeleted);
     EXPECT_TRUE(s_fWatchedFreed.load()) << "Synchronizer left behind";
     EXPECT_EQ(0u, failures.Count());
 
     // An idle object's Synchronizer goes with the object at once.
     pObject = new CRecorder();
-    pObject->Send(EventRecord);
+    pObject->Post(EventRecord);
     WatchDelete(pObject->SynchronizerAddress());
     pObject->Release();
     EXPECT_TRUE(s_fWatchedFreed.load());
@@ -258,7 +254,7 @@ TEST(Synchronizer, UnknownEventIsFatal)
 {
     FailureCapture failures;
     CRecorder *pObject = new CRecorder();
-    pObject->Send(77);
+    pObject->Post(77);
     ASSERT_EQ(1u, failures.Count());
     EXPECT_TRUE(
         failures.Contains(L"CRecorder::Dispatch: Fatal error 0x4d from CRecorder::EventType %u"))

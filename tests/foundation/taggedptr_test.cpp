@@ -8,7 +8,8 @@ using testsupport::FailureCapture;
 
 namespace
 {
-// A tagged-counted object that records how it died.
+// A tagged-counted object that records how it died; each test owns its objects on its main
+// thread.
 class CCounted
 {
 public:

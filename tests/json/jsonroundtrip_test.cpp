@@ -11,6 +11,7 @@
 
 namespace
 {
+// Makes trees and their spaced text from one seed; each test iteration owns one.
 class RandomTrees
 {
 public:

@@ -1,10 +1,11 @@
-// The tree's operations and its compact text form.
+// The tree's operations and its compact text form, on the test's main thread.
 #include "lib/jsonvalue.h"
 
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <cstdio>
+#include <cstring>
 #include <limits>
 #include <memory>
 #include <string>
@@ -92,59 +93,28 @@ TEST(JsonWriter, SampleTreeMemberOrderAndDuplicates)
 
 TEST(JsonWriter, EscapeTableByteForByte)
 {
-    EXPECT_EQ("\"a\\\"b\\\\c\\/d\\t\"", QuotedText("a\"b\\c/d\t"));
-    EXPECT_EQ("\"\\u007f\"", QuotedText("\x7f"));
-    EXPECT_EQ("\"\\u00ff\"", QuotedText("\xff"));
-    EXPECT_EQ("\"\\u0001\\u00e9\"", QuotedText("\x01\xe9"));
     // The payload ends at its first zero byte.
     EXPECT_EQ("\"ab\"", QuotedText(std::string("ab\0cd", 5)));
+    EXPECT_EQ("\"\\u0001\\u00e9\\\"\"", QuotedText("\x01\xe9\"")); // escapes side by side
 
+    // Short escapes for these, \u00xx for every other control or non-ASCII byte.
+    const char c_szShort[] = "\"\\/\b\t\n\f\r";
+    const char c_szLetters[] = "\"\\/btnfr";
     for (int b = 1; b < 256; b++)
     {
-        std::string strExpected;
-        switch (b)
+        const char *pchShort = strchr(c_szShort, b);
+        char szExpected[8] = {static_cast<char>(b), '\0'};
+        if (pchShort != nullptr)
         {
-        case '"':
-            strExpected = "\\\"";
-            break;
-        case '\\':
-            strExpected = "\\\\";
-            break;
-        case '/':
-            strExpected = "\\/";
-            break;
-        case 0x08:
-            strExpected = "\\b";
-            break;
-        case 0x09:
-            strExpected = "\\t";
-            break;
-        case 0x0A:
-            strExpected = "\\n";
-            break;
-        case 0x0C:
-            strExpected = "\\f";
-            break;
-        case 0x0D:
-            strExpected = "\\r";
-            break;
-        default:
-            if (b < 0x20 || b >= 0x7F)
-            {
-                char szHex[8];
-                snprintf(szHex, sizeof(szHex), "\\u%.4x", b);
-                strExpected = szHex;
-            }
-            else
-            {
-                strExpected = std::string(1, static_cast<char>(b));
-            }
+            snprintf(szExpected, sizeof(szExpected), "\\%c", c_szLetters[pchShort - c_szShort]);
+        }
+        else if (b < 0x20 || b >= 0x7F)
+        {
+            snprintf(szExpected, sizeof(szExpected), "\\u%.4x", b);
         }
         // Between plain bytes, so both the run copying and the escape are exercised.
-        std::string strPayload = "x";
-        strPayload += static_cast<char>(b);
-        strPayload += "y";
-        EXPECT_EQ("\"x" + strExpected + "y\"", QuotedText(strPayload)) << "byte " << b;
+        std::string strPayload = std::string("x") + static_cast<char>(b) + "y";
+        EXPECT_EQ("\"x" + std::string(szExpected) + "y\"", QuotedText(strPayload)) << "byte " << b;
     }
 }
 

@@ -12,8 +12,9 @@
 
 namespace
 {
-const wchar_t c_wszServerKey[] =
-    L"Software\\Classes\\CLSID\\{B5368813-926B-449C-9676-DB6ED6F8F428}\\InprocServer32";
+#define COMPONENT_CLASS_KEY L"Software\\Classes\\CLSID\\{B5368813-926B-449C-9676-DB6ED6F8F428}"
+const wchar_t c_wszClassKey[] = COMPONENT_CLASS_KEY;
+const wchar_t c_wszServerKey[] = COMPONENT_CLASS_KEY L"\\InprocServer32";
 
 std::wstring ComponentPath()
 {
@@ -23,14 +24,10 @@ std::wstring ComponentPath()
 // The registered server's value, or empty when the class is not registered.
 std::wstring ReadServerValue(const wchar_t *wszValue)
 {
-    wchar_t wsz[1024] = L"";
-    DWORD cb = sizeof(wsz);
-    if (RegGetValueW(HKEY_LOCAL_MACHINE, c_wszServerKey, wszValue, RRF_RT_REG_SZ, nullptr, wsz,
-                     &cb) != ERROR_SUCCESS)
-    {
-        return std::wstring();
-    }
-    return wsz;
+    DWORD dwType = 0;
+    std::wstring wstr;
+    return testsupport::HklmReadRaw(c_wszServerKey, wszValue, &dwType, &wstr) ? wstr.c_str()
+                                                                              : std::wstring();
 }
 
 testsupport::ChildResult Regsvr32(const std::wstring &wstrSwitches, const std::wstring &wstrPath)
@@ -81,7 +78,8 @@ CreateResult CreateOnPoolThread()
     return work.result;
 }
 
-// Registers the component for one test and puts back what was registered before it.
+// Registers the component for one test and puts back what was registered before it. Runs
+// on the test's main thread.
 class PlatformComponentRegistration : public ::testing::Test
 {
 protected:
@@ -103,38 +101,31 @@ protected:
 };
 } // namespace
 
-TEST_F(PlatformComponentRegistration, RegistersTheDllWithThreadingModelBoth)
+// Registered with threading model "Both", the class is created in-process (the object is
+// the DLL's own, not a proxy to another process) on a pool thread whenever the process uses
+// the MTA: through its main thread (our own hosts) or, where no thread entered it (Wine's
+// svchost), through CoIncrementMTAUsage, and only as long as that lasts.
+TEST_F(PlatformComponentRegistration, CreatedOnAPoolThreadWhileTheProcessUsesTheMta)
 {
     EXPECT_EQ(0, _wcsicmp(ComponentPath().c_str(), ReadServerValue(nullptr).c_str()))
         << testsupport::Narrow(ReadServerValue(nullptr));
     EXPECT_EQ(L"Both", ReadServerValue(L"ThreadingModel"));
-}
 
-TEST_F(PlatformComponentRegistration, CreatedOnAPoolThreadOfAnMtaProcess)
-{
-    ASSERT_HRESULT_SUCCEEDED(CoInitializeEx(nullptr, COINIT_MULTITHREADED));
-    CreateResult result = CreateOnPoolThread();
-    EXPECT_EQ(S_OK, result.hr);
-    // In-process: the object is the DLL's own, not a proxy to another process.
-    EXPECT_EQ(GetCurrentProcessId(), result.dwHostProcessId);
-    EXPECT_EQ(1u, result.cObjects);
-    CoUninitialize();
-}
-
-TEST_F(PlatformComponentRegistration, CreatedWithNoThreadInTheMtaOnlyAfterCoIncrementMtaUsage)
-{
-    // Wine's svchost: no thread of the process ever entered the MTA.
     EXPECT_EQ(CO_E_NOTINITIALIZED, CreateOnPoolThread().hr);
-
     CO_MTA_USAGE_COOKIE cookie = nullptr;
     ASSERT_HRESULT_SUCCEEDED(CoIncrementMTAUsage(&cookie));
     CreateResult result = CreateOnPoolThread();
     EXPECT_EQ(S_OK, result.hr);
     EXPECT_EQ(GetCurrentProcessId(), result.dwHostProcessId);
     EXPECT_HRESULT_SUCCEEDED(CoDecrementMTAUsage(cookie));
-
-    // Once the process's last use of the MTA is gone, creation fails again.
     EXPECT_EQ(CO_E_NOTINITIALIZED, CreateOnPoolThread().hr);
+
+    ASSERT_HRESULT_SUCCEEDED(CoInitializeEx(nullptr, COINIT_MULTITHREADED));
+    result = CreateOnPoolThread();
+    EXPECT_EQ(S_OK, result.hr);
+    EXPECT_EQ(GetCurrentProcessId(), result.dwHostProcessId);
+    EXPECT_EQ(1u, result.cObjects);
+    CoUninitialize();
 }
 
 TEST_F(PlatformComponentRegistration, UnregisterRemovesTheClass)
@@ -144,9 +135,7 @@ TEST_F(PlatformComponentRegistration, UnregisterRemovesTheClass)
     EXPECT_EQ(L"", ReadServerValue(nullptr));
     HKEY hKey = nullptr;
     EXPECT_EQ(ERROR_FILE_NOT_FOUND,
-              RegOpenKeyExW(HKEY_LOCAL_MACHINE,
-                            L"Software\\Classes\\CLSID\\{B5368813-926B-449C-9676-DB6ED6F8F428}", 0,
-                            KEY_READ, &hKey));
+              RegOpenKeyExW(HKEY_LOCAL_MACHINE, c_wszClassKey, 0, KEY_READ, &hKey));
     ASSERT_HRESULT_SUCCEEDED(CoInitializeEx(nullptr, COINIT_MULTITHREADED));
     EXPECT_EQ(REGDB_E_CLASSNOTREG, CreateOnPoolThread().hr);
     CoUninitialize();

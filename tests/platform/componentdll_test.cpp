@@ -10,6 +10,7 @@ namespace
 typedef HRESULT(STDAPICALLTYPE *PFN_GET_CLASS_OBJECT)(REFCLSID, REFIID, LPVOID *);
 typedef HRESULT(STDAPICALLTYPE *PFN_CAN_UNLOAD_NOW)();
 
+// Loads the DLL for one test on the test's main thread and frees it afterwards.
 class PlatformComponentDll : public ::testing::Test
 {
 protected:

@@ -1,5 +1,6 @@
 // telvanectl's platform commands on states of their own: what they publish is what the
-// facility's query reads, and what they refuse changes nothing.
+// facility's query reads, and what they refuse changes nothing. Runs on the test's main
+// thread.
 #include "platform/statenotify/statenotify.h"
 #include "platform/statenotify/statenotifypublish.h"
 #include "tests/common/testsupport.h"
@@ -9,31 +10,24 @@
 
 #include <string>
 
-using platformtest::NewStateName;
-using platformtest::StateNameText;
-using platformtest::TelvanectlCommand;
-
 namespace
 {
-testsupport::ChildResult Ctl(const std::wstring &wstrArgs)
+// The 32-bit value and stamp the facility's query reads.
+DWORD QueryValue(WNF_STATE_NAME stateName, WNF_CHANGE_STAMP *pStamp)
 {
-    return testsupport::RunChild(TelvanectlCommand() + L" " + wstrArgs);
-}
-
-WNF_CHANGE_STAMP StampOf(WNF_STATE_NAME stateName)
-{
-    WNF_CHANGE_STAMP stamp = 0;
-    BYTE rgb[WNF_STATE_MAX_DATA_SIZE];
-    ULONG cb = sizeof(rgb);
-    EXPECT_EQ(STATUS_SUCCESS, NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, rgb, &cb));
-    return stamp;
+    DWORD dwValue = 0xFFFFFFFF;
+    ULONG cb = sizeof(dwValue);
+    EXPECT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, pStamp, &dwValue, &cb));
+    EXPECT_EQ(*pStamp == 0 ? 0u : sizeof(DWORD), cb);
+    return dwValue;
 }
 } // namespace
 
 TEST(TelvanectlPlatform, RefusesBadArgumentsAndPublishesNothing)
 {
-    WNF_STATE_NAME stateName = NewStateName();
-    const std::wstring wstrName = StateNameText(stateName);
+    WNF_STATE_NAME stateName = platformtest::NewStateName();
+    const std::wstring wstrState = L"platform state " + platformtest::StateNameText(stateName);
     struct Case
     {
         std::wstring wstrArgs;
@@ -43,31 +37,34 @@ TEST(TelvanectlPlatform, RefusesBadArgumentsAndPublishesNothing)
         {L"platform state", "needs a state NAME"},
         {L"platform state zz 1", "needs a state NAME"},
         {L"platform state 0x10000000000000000 1", "needs a state NAME"},
-        {L"platform state " + wstrName + L" -1", "VALUE must be"},
-        {L"platform state " + wstrName + L" 4294967296", "VALUE must be"},
-        {L"platform state " + wstrName + L" 0x", "VALUE must be"},
-        {L"platform state " + wstrName + L" 12abc", "VALUE must be"},
-        {L"platform state " + wstrName + L" 1 2", "too many arguments"},
+        {wstrState + L" -1", "VALUE must be"},
+        {wstrState + L" 4294967296", "VALUE must be"},
+        {wstrState + L" 0x", "VALUE must be"},
+        {wstrState + L" 12abc", "VALUE must be"},
+        {wstrState + L" 1 2", "too many arguments"},
         {L"platform backlight 1 2", "too many arguments"},
         {L"platform power on", "VALUE must be"},
     };
     for (const Case &c : rgCases)
     {
-        testsupport::ChildResult result = Ctl(c.wstrArgs);
-        EXPECT_EQ(2u, result.dwExitCode) << testsupport::Narrow(c.wstrArgs);
-        EXPECT_NE(std::string::npos, result.strOutput.find(c.szProblem))
-            << testsupport::Narrow(c.wstrArgs) << ": " << result.strOutput;
+        SCOPED_TRACE(testsupport::Narrow(c.wstrArgs));
+        testsupport::ChildResult result = testsupport::RunTelvanectl(c.wstrArgs);
+        EXPECT_EQ(2u, result.dwExitCode);
+        EXPECT_NE(std::string::npos, result.strOutput.find(c.szProblem)) << result.strOutput;
     }
-    EXPECT_EQ(0u, StampOf(stateName));
+    WNF_CHANGE_STAMP stamp = 0;
+    QueryValue(stateName, &stamp);
+    EXPECT_EQ(0u, stamp);
 }
 
 TEST(TelvanectlPlatform, StatePublishesAndShowsThirtyTwoBitValues)
 {
-    WNF_STATE_NAME stateName = NewStateName();
-    const std::wstring wstrName = StateNameText(stateName);
-    const std::string strLabel = "state " + testsupport::Narrow(wstrName);
+    WNF_STATE_NAME stateName = platformtest::NewStateName();
+    const std::wstring wstrState = L"platform state " + platformtest::StateNameText(stateName);
+    const std::string strLabel =
+        "state " + testsupport::Narrow(platformtest::StateNameText(stateName));
 
-    testsupport::ChildResult result = Ctl(L"platform state " + wstrName);
+    testsupport::ChildResult result = testsupport::RunTelvanectl(wstrState);
     EXPECT_EQ(0u, result.dwExitCode);
     EXPECT_EQ(strLabel + ": not published\r\n", result.strOutput);
 
@@ -80,28 +77,22 @@ TEST(TelvanectlPlatform, StatePublishesAndShowsThirtyTwoBitValues)
     WNF_CHANGE_STAMP stamp = 0;
     for (const Case &c : rgCases)
     {
+        SCOPED_TRACE(testsupport::Narrow(c.wszValue));
         stamp++;
         const std::string strLine = strLabel + " = " + std::to_string(c.dwExpected) +
                                     " (change stamp " + std::to_string(stamp) + ")\r\n";
-        result = Ctl(L"platform state " + wstrName + L" " + c.wszValue);
-        EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
+        result = testsupport::RunTelvanectl(wstrState + L" " + c.wszValue);
+        EXPECT_EQ(0u, result.dwExitCode);
         EXPECT_EQ(strLine, result.strOutput);
-        DWORD dwValue = 0;
-        ULONG cb = sizeof(dwValue);
         WNF_CHANGE_STAMP stampRead = 0;
-        EXPECT_EQ(STATUS_SUCCESS,
-                  NtQueryWnfStateData(&stateName, nullptr, nullptr, &stampRead, &dwValue, &cb));
+        EXPECT_EQ(c.dwExpected, QueryValue(stateName, &stampRead));
         EXPECT_EQ(stamp, stampRead);
-        EXPECT_EQ(sizeof(DWORD), cb);
-        EXPECT_EQ(c.dwExpected, dwValue);
-        result = Ctl(L"platform state " + wstrName);
-        EXPECT_EQ(strLine, result.strOutput);
+        EXPECT_EQ(strLine, testsupport::RunTelvanectl(wstrState).strOutput);
     }
 
     // Data of another size, as another component might publish, shows as bytes.
     const BYTE rgb[] = {0x01, 0xA2};
     ASSERT_HRESULT_SUCCEEDED(StateNotifyPublish(stateName, rgb, sizeof(rgb), nullptr));
-    result = Ctl(L"platform state " + wstrName);
     EXPECT_EQ(strLabel + " = 2 bytes: 01 a2 (change stamp " + std::to_string(stamp + 1) + ")\r\n",
-              result.strOutput);
+              testsupport::RunTelvanectl(wstrState).strOutput);
 }
