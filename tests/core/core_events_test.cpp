@@ -1,7 +1,7 @@
 // An event number a class does not know is a fatal error reported from the class's Dispatch
 // with its "EventType %u" name as it stands and the number as the code (the activity endpoint
 // keeps the client library's historical class name in it).
-#include "tests/core/coretestsupport.h"
+#include "tests/core/coretest.h"
 #include "service/cserviceactivity.h"
 #include "service/cservicecollector.h"
 #include "service/cserviceoperation.h"
@@ -11,10 +11,8 @@ using namespace coretest;
 
 TEST(CoreDispatch, UnknownEventsNameTheClassAndTheNumber)
 {
-    testsupport::FailureCapture failures;
-    std::wstring wstrActivity = pipetest::UniquePipeName(L"evact");
-    std::wstring wstrCollector = pipetest::UniquePipeName(L"evcol");
-    CTestCoordinator service(wstrActivity.c_str(), wstrCollector.c_str());
+    FailureCapture failures;
+    CTestCoordinator service;
     DWORD dwError = 0;
     // Endpoints whose pipe instances are made but never listened on.
     CServiceActivity *pActivity = new CServiceActivity(&service, &dwError);
@@ -39,15 +37,14 @@ TEST(CoreDispatch, UnknownEventsNameTheClassAndTheNumber)
     };
     for (const Case &c : rgCases)
     {
-        SCOPED_TRACE(testsupport::Narrow(c.wszFunction));
+        SCOPED_TRACE(Narrow(c.wszFunction));
         size_t cBefore = failures.Count();
         c.pObject->Dispatch(99, 0, 0, 0);
         ASSERT_EQ(cBefore + 1, failures.Count());
         std::wstring wstrLine = failures.Lines().back();
-        EXPECT_NE(std::wstring::npos, wstrLine.find(c.wszFunction))
-            << testsupport::Narrow(wstrLine);
+        EXPECT_NE(std::wstring::npos, wstrLine.find(c.wszFunction)) << Narrow(wstrLine);
         EXPECT_NE(std::wstring::npos, wstrLine.find(std::wstring(L"0x63 from ") + c.wszName))
-            << testsupport::Narrow(wstrLine);
+            << Narrow(wstrLine);
     }
     pOperation->Release(0);
     pCollector->Release(0);

@@ -1,6 +1,6 @@
 // What clients can make the service hold: one log is flushed early once it holds more than its
 // bound, and unfinished items of all connections together stay within the service's budget.
-#include "tests/core/coretestsupport.h"
+#include "tests/core/coretest.h"
 #include "servicelib/cpipereassembly.h"
 
 using namespace coretest;

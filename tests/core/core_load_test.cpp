@@ -1,6 +1,6 @@
 // Many clients at once: every event and every result lands in exactly one delivered log,
 // nothing lost (events sent right after the start included) and nothing duplicated.
-#include "tests/core/coretestsupport.h"
+#include "tests/core/coretest.h"
 #include "service/cserviceoperation.h"
 
 #include <set>
@@ -30,7 +30,7 @@ TEST_F(CoreLoad, TwoHundredActivitiesAndFiftyCollectors)
     for (size_t i = 0; i < cCollectors; i++)
     {
         rgCollectorIds.push_back(NewGuid());
-        rgCollectors.emplace_back(new CCollectorThread(m_wstrCollectorPipe, rgCollectorIds.back(),
+        rgCollectors.emplace_back(new CCollectorThread(CollectorPipe(), rgCollectorIds.back(),
                                                        "\"r" + std::to_string(i) + "\""));
     }
     for (auto &collector : rgCollectors)
@@ -55,7 +55,7 @@ TEST_F(CoreLoad, TwoHundredActivitiesAndFiftyCollectors)
     {
         rgThreads.emplace_back([&, i] {
             CActivityClient client(c_dwLoadStepMs);
-            HRESULT hr = client.Connect(m_wstrActivityPipe.c_str());
+            HRESULT hr = client.Connect(ActivityPipe().c_str());
             const char *szStep = "connect";
             if (SUCCEEDED(hr))
             {

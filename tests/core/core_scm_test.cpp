@@ -2,118 +2,79 @@
 // the README says (service installed, platform component registered, delivery values set):
 // clients are served under Wine's svchost.exe and under telvanehost.exe, a stop with a hundred
 // clients drains them and the host leaves cleanly (its unload check passed), and a start
-// beside another holder of a pipe name is refused without harm. These tests own "Telvane".
-#include "tests/core/coretestsupport.h"
+// beside another holder of a pipe name is refused without harm. These tests own "Telvane" and
+// run on the test thread; the collector runs on its own.
+#include "tests/core/coretest.h"
 #include "tests/common/scmtest.h"
 
 using namespace coretest;
 
 namespace
 {
-const wchar_t c_wszTelvane[] = L"Telvane";
-const DWORD c_dwStateWaitMs = 60000;
-
-testsupport::ChildResult RunInBin(const std::wstring &wstrCommand)
-{
-    return testsupport::RunChild(wstrCommand);
-}
-
 class CoreScm : public ::testing::Test
 {
 protected:
-    void SetUp() override
-    {
-        EnableFileDelivery();
-        // The README's steps: install, register the component.
-        ASSERT_EQ(0u, RunInBin(L"\"" + testsupport::BinDir() + L"telvanerun.exe\" -r").dwExitCode);
-        ASSERT_EQ(0u,
-                  RunInBin(L"regsvr32 /s \"" + testsupport::BinDir() + L"platformcomponent.dll\"")
-                      .dwExitCode);
-    }
+    void SetUp() override { AllowDelivery(1); }
     void TearDown() override
     {
-        RunInBin(L"\"" + testsupport::BinDir() + L"telvanerun.exe\" -u");
-        RunInBin(L"regsvr32 /s /u \"" + testsupport::BinDir() + L"platformcomponent.dll\"");
-        testsupport::ServiceStopAndDelete(c_wszTelvane);
+        TelvaneUninstall();
         for (const GUID &logId : m_rgLogIds)
         {
             DeleteLogsOf(logId);
         }
     }
 
-    void UseTelvaneHost()
+    // A client on the product's activity pipe, started; its run's files go at the end.
+    std::unique_ptr<CActivityClient> StartActivity()
     {
-        ASSERT_TRUE(testsupport::ServiceSetImagePath(c_wszTelvane, L"\"" + testsupport::BinDir() +
-                                                            L"telvanehost.exe\" -k OVTCBNetwork"));
+        m_rgLogIds.push_back(NewGuid());
+        std::unique_ptr<CActivityClient> client(new CActivityClient(c_dwWaitMs));
+        EXPECT_EQ(S_OK, client->Connect(c_wszTelvaneActivityPipe));
+        EXPECT_EQ(S_OK, client->Start(NewGuid(), m_rgLogIds.back()));
+        return client;
     }
 
-    // Starts the service and checks the host it runs in; returns its process id.
-    DWORD StartIn(const wchar_t *wszHostImage)
+    // Clients on the real pipes; a stop with a hundred of them connected drains them all.
+    void ServeAndDrain(TelvaneHost hostKind, const wchar_t *wszHostImage)
     {
-        EXPECT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
-        SERVICE_STATUS_PROCESS status = {};
-        EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs, &status))
-            << status.dwCurrentState;
-        testsupport::CServiceProcess host(status.dwProcessId);
-        EXPECT_NE(std::wstring::npos, host.ImageName().find(wszHostImage));
-        return status.dwProcessId;
-    }
-
-    // Clients on the real pipes; a stop with all of them connected drains them.
-    void ServeAndStopWithClients(const wchar_t *wszHostImage, size_t cActivities)
-    {
-        DWORD dwProcessId = StartIn(wszHostImage);
-        testsupport::CServiceProcess host(dwProcessId);
+        ASSERT_NO_FATAL_FAILURE(TelvaneInstall(hostKind));
+        CServiceProcess host(TelvaneStart());
         ASSERT_TRUE(host.Opened());
-
+        EXPECT_NE(std::wstring::npos, host.ImageName().find(wszHostImage));
         GUID collectorId = NewGuid();
         CCollectorThread collector(c_wszTelvaneCollectorPipe, collectorId, "{\"host\":1}");
         ASSERT_TRUE(collector.WaitRegistered());
 
         // One run from start to end while the collector is there.
-        GUID logDone = NewGuid();
         GUID eventId = NewGuid();
-        m_rgLogIds.push_back(logDone);
-        {
-            CActivityClient client(c_dwWaitMs);
-            ASSERT_EQ(S_OK, client.Connect(c_wszTelvaneActivityPipe));
-            ASSERT_EQ(S_OK, client.Start(NewGuid(), logDone));
-            ASSERT_EQ(S_OK, client.SendEvent(eventId, "\"done\"", 6));
-            ASSERT_TRUE(collector.WaitRequests(1));
-            ASSERT_EQ(S_OK, client.Stop());
-        }
-        std::vector<DeliveredLog> rgDone = WaitForLogs(logDone, 1);
-        ASSERT_EQ(1u, rgDone.size());
-        EXPECT_EQ((std::vector<std::string>{"\"done\""}), GroupValues(*rgDone[0].doc, eventId));
+        std::unique_ptr<CActivityClient> done = StartActivity();
+        EXPECT_EQ(S_OK, done->SendEvent(eventId, "\"done\"", 6));
+        ASSERT_TRUE(collector.WaitRequests(1));
+        EXPECT_EQ(S_OK, done->Stop());
+        EXPECT_EQ((std::vector<std::string>{"\"done\""}), OnlyLogValues(m_rgLogIds[0], eventId));
         EXPECT_EQ((std::vector<std::string>{"{\"host\":1}"}),
-                  GroupValues(*rgDone[0].doc, collectorId));
+                  OnlyLogValues(m_rgLogIds[0], collectorId));
 
         // Then many runs still going when the stop comes.
         std::vector<std::unique_ptr<CActivityClient>> rgClients;
-        std::vector<GUID> rgLogIds;
-        for (size_t i = 0; i < cActivities; i++)
+        for (size_t i = 0; i < 100; i++)
         {
-            rgLogIds.push_back(NewGuid());
-            m_rgLogIds.push_back(rgLogIds.back());
-            rgClients.emplace_back(new CActivityClient(c_dwWaitMs));
-            ASSERT_EQ(S_OK, rgClients.back()->Connect(c_wszTelvaneActivityPipe));
-            ASSERT_EQ(S_OK, rgClients.back()->Start(NewGuid(), rgLogIds.back()));
-            ASSERT_EQ(S_OK, rgClients.back()->SendEvent(eventId, "1", 1));
+            rgClients.push_back(StartActivity());
+            EXPECT_EQ(S_OK, rgClients.back()->SendEvent(eventId, "1", 1));
         }
-        ASSERT_TRUE(collector.WaitRequests(1 + cActivities, 120000));
-
-        EXPECT_EQ(0u, testsupport::ServiceStop(c_wszTelvane));
+        ASSERT_TRUE(collector.WaitRequests(m_rgLogIds.size(), 120000));
+        EXPECT_TRUE(TelvaneStop());
         SERVICE_STATUS_PROCESS status = {};
-        EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, 120000, &status));
+        EXPECT_TRUE(ServiceQueryStatus(c_wszTelvane, &status));
         EXPECT_EQ(0u, status.dwWin32ExitCode);
         // A clean exit: the unload check found nothing left (a failed check ends the host with
         // a fail-fast code).
-        EXPECT_EQ(0u, host.WaitForExitCode(c_dwStateWaitMs));
-        for (const GUID &logId : rgLogIds)
+        EXPECT_EQ(0u, host.WaitForExitCode(2 * c_dwWaitMs));
+        for (const GUID &logId : m_rgLogIds)
         {
             std::vector<DeliveredLog> rgLogs = LogsOf(logId);
             ASSERT_EQ(1u, rgLogs.size());
-            EXPECT_TRUE((*rgLogs[0].doc)["LogEnd"].GetBool());
+            EXPECT_TRUE(EndsRun(*rgLogs[0].doc));
         }
     }
 
@@ -123,26 +84,26 @@ protected:
 
 TEST_F(CoreScm, ServesAndDrainsUnderSvchost)
 {
-    ServeAndStopWithClients(L"svchost.exe", 100);
+    ServeAndDrain(TelvaneHost::Svchost, L"svchost.exe");
 }
 
 TEST_F(CoreScm, ServesAndDrainsUnderTelvaneHost)
 {
-    UseTelvaneHost();
-    ServeAndStopWithClients(L"telvanehost.exe", 100);
+    ServeAndDrain(TelvaneHost::TelvaneHost, L"telvanehost.exe");
 }
 
 TEST_F(CoreScm, StartBesideASquatterIsRefusedWithoutHarm)
 {
+    ASSERT_NO_FATAL_FAILURE(TelvaneInstall());
     HANDLE hSquat =
         CreateNamedPipeW(c_wszTelvaneActivityPipe, PIPE_ACCESS_DUPLEX | FILE_FLAG_OVERLAPPED,
                          PIPE_TYPE_MESSAGE | PIPE_READMODE_MESSAGE, 1, 1024, 1024, 0, nullptr);
     ASSERT_NE(INVALID_HANDLE_VALUE, hSquat);
     // Wine's control manager answers 1053 when STOPPED comes before RUNNING.
-    DWORD dwStart = testsupport::ServiceStart(c_wszTelvane, {});
+    DWORD dwStart = ServiceStart(c_wszTelvane);
     EXPECT_TRUE(dwStart == 0 || dwStart == ERROR_SERVICE_REQUEST_TIMEOUT) << dwStart;
     SERVICE_STATUS_PROCESS status = {};
-    EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
+    EXPECT_TRUE(ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, 2 * c_dwWaitMs, &status));
     EXPECT_EQ(static_cast<DWORD>(ERROR_ALREADY_EXISTS), status.dwWin32ExitCode);
     // The collector pipe was never made: nothing of the service listens.
     EXPECT_FALSE(WaitNamedPipeW(c_wszTelvaneCollectorPipe, 1));
@@ -150,7 +111,6 @@ TEST_F(CoreScm, StartBesideASquatterIsRefusedWithoutHarm)
     CloseHandle(hSquat);
 
     // Once the name is free the service starts as usual.
-    StartIn(L"svchost.exe");
-    EXPECT_EQ(0u, testsupport::ServiceStop(c_wszTelvane));
-    EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs));
+    EXPECT_NE(0u, TelvaneStart());
+    EXPECT_TRUE(TelvaneStop());
 }

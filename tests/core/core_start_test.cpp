@@ -1,7 +1,7 @@
 // Start refuses to share its pipes: when another process (here: another handle) already holds
 // either name, the service reports STOPPED with the error, starts nothing and leaves nothing
-// running, so the DLL can be unloaded at once.
-#include "tests/core/coretestsupport.h"
+// running, so the DLL can be unloaded at once. With both names free it starts as usual.
+#include "tests/core/coretest.h"
 #include "service/cserviceactivity.h"
 #include "service/cservicecollector.h"
 #include "service/cserviceoperation.h"
@@ -10,13 +10,6 @@ using namespace coretest;
 
 namespace
 {
-struct SquatCase
-{
-    const char *szName;
-    bool fActivity;
-    bool fCollector;
-};
-
 bool NameExists(const std::wstring &wstrPipe)
 {
     return WaitNamedPipeW(wstrPipe.c_str(), 1) || GetLastError() != ERROR_FILE_NOT_FOUND;
@@ -25,21 +18,25 @@ bool NameExists(const std::wstring &wstrPipe)
 
 TEST(CoreStart, RefusesToStartBesideAnotherHolderOfItsPipes)
 {
-    const SquatCase rgCases[] = {
+    const struct
+    {
+        const char *szName;
+        bool fActivity; // the name is taken
+        bool fCollector;
+    } rgCases[] = {
         {"activity pipe taken", true, false},
         {"collector pipe taken", false, true},
         {"both taken", true, true},
+        {"both free", false, false},
     };
-    testsupport::FailureCapture failures;
-    CTraceSession trace;
-    for (const SquatCase &c : rgCases)
+    FailureCapture failures;
+    for (const auto &c : rgCases)
     {
         SCOPED_TRACE(c.szName);
-        std::wstring wstrActivity = pipetest::UniquePipeName(L"squatact");
-        std::wstring wstrCollector = pipetest::UniquePipeName(L"squatcol");
+        CTestCoordinator service;
         std::vector<HANDLE> rgSquat;
-        for (const std::wstring *pName :
-             {c.fActivity ? &wstrActivity : nullptr, c.fCollector ? &wstrCollector : nullptr})
+        for (const std::wstring *pName : {c.fActivity ? &service.ActivityPipe() : nullptr,
+                                          c.fCollector ? &service.CollectorPipe() : nullptr})
         {
             if (pName != nullptr)
             {
@@ -49,50 +46,31 @@ TEST(CoreStart, RefusesToStartBesideAnotherHolderOfItsPipes)
                 ASSERT_NE(INVALID_HANDLE_VALUE, rgSquat.back());
             }
         }
+        bool fRefused = !rgSquat.empty();
+        service.OnStart();
+        DWORD dwState = fRefused ? SERVICE_STOPPED : SERVICE_RUNNING;
+        ASSERT_TRUE(WaitUntil([&] { return service.State() == dwState; })) << service.State();
+        EXPECT_EQ(fRefused ? static_cast<DWORD>(ERROR_ALREADY_EXISTS) : 0u, service.ExitCode());
+        // A free name has a listener only while the service runs.
+        if (!c.fActivity)
         {
-            CTestCoordinator service(wstrActivity.c_str(), wstrCollector.c_str());
-            service.OnStart();
-            ASSERT_TRUE(WaitUntil([&] { return service.State() == SERVICE_STOPPED; }))
-                << service.State();
-            EXPECT_EQ(static_cast<DWORD>(ERROR_ALREADY_EXISTS), service.ExitCode());
-            // Nothing listens on a free name, and nothing of the service exists.
-            if (!c.fActivity)
-            {
-                EXPECT_FALSE(NameExists(wstrActivity));
-            }
-            if (!c.fCollector)
-            {
-                EXPECT_FALSE(NameExists(wstrCollector));
-            }
-            EXPECT_EQ(0, CServiceActivity::LiveCount());
-            EXPECT_EQ(0, CServiceCollector::LiveCount());
-            EXPECT_EQ(0, CServiceOperation::LiveCount());
+            EXPECT_EQ(!fRefused, NameExists(service.ActivityPipe()));
         }
+        if (!c.fCollector)
+        {
+            EXPECT_EQ(!fRefused, NameExists(service.CollectorPipe()));
+        }
+        if (!fRefused)
+        {
+            service.StopAndCheckDrained();
+        }
+        EXPECT_EQ(0, CServiceActivity::LiveCount());
+        EXPECT_EQ(0, CServiceCollector::LiveCount());
+        EXPECT_EQ(0, CServiceOperation::LiveCount());
         for (HANDLE h : rgSquat)
         {
             CloseHandle(h);
         }
     }
-    EXPECT_EQ(0u, failures.Count());
-    for (const std::wstring &line : failures.Lines())
-    {
-        ADD_FAILURE() << testsupport::Narrow(line);
-    }
-}
-
-// The same coordinator, once its names are free, starts as usual.
-TEST(CoreStart, StartsWhenItsNamesAreFree)
-{
-    testsupport::FailureCapture failures;
-    std::wstring wstrActivity = pipetest::UniquePipeName(L"freeact");
-    std::wstring wstrCollector = pipetest::UniquePipeName(L"freecol");
-    CTestCoordinator service(wstrActivity.c_str(), wstrCollector.c_str());
-    service.OnStart();
-    ASSERT_TRUE(WaitUntil([&] { return service.State() == SERVICE_RUNNING; }));
-    EXPECT_TRUE(NameExists(wstrActivity));
-    EXPECT_TRUE(NameExists(wstrCollector));
-    service.OnStop();
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), service.State());
-    EXPECT_EQ(0u, service.ExitCode());
-    EXPECT_EQ(0u, failures.Count());
+    failures.ExpectNone();
 }

@@ -1,8 +1,11 @@
 // A stop drains whatever is going on: no clients, clients in the middle of an event, a
 // collection outstanding, a retiring operation, a hundred clients, clients still arriving. The
 // fixture's stop checks that nothing is left and every tagged count is back to zero.
-#include "tests/core/coretestsupport.h"
+#include "tests/core/coretest.h"
+#include "client/ccollectorclient.h"
+#include "inc/telvanepipe.h"
 
+#include <atomic>
 #include <thread>
 
 using namespace coretest;
@@ -11,21 +14,14 @@ namespace
 {
 class CoreStop : public CCoreTest
 {
-protected:
-    void WaitForStarts(size_t c)
-    {
-        ASSERT_TRUE(m_trace.WaitFor("TelvaneService::ReportConnectedActivity()", c));
-    }
 };
-
-const char c_szDone[] =
-    "TelvaneService::WaitForDestroyComplete() - all IDestroyables complete, we're done";
 } // namespace
 
 TEST_F(CoreStop, WithNoClients)
 {
     Stop();
-    EXPECT_EQ(1u, m_trace.Count(c_szDone));
+    EXPECT_EQ(1u, m_trace.Count("TelvaneService::WaitForDestroyComplete() - all IDestroyables "
+                                "complete, we're done"));
     // Both listeners were torn down as never-identified endpoints.
     EXPECT_LE(2u, m_trace.Count("CServiceActivity::Dispatch_AdvanceCompletion() - destruction "
                                 "complete, setting event"));
@@ -36,7 +32,7 @@ TEST_F(CoreStop, WithClientsInTheMiddleOfAnEvent)
     GUID logId = NewGuid();
     GUID eventId = NewGuid();
     std::unique_ptr<CActivityClient> client = StartActivity(NewGuid(), logId);
-    EXPECT_EQ(S_OK, client->SendEvent(eventId, "\"whole\"", 7));
+    SendEvent(*client, eventId, "\"whole\"");
     // Half an event: a first part whose last part never comes.
     TELVANE_ACTIVITY_EVENT header = {TELVANE_ACTIVITY_EVENT_OPCODE, {}, 0, 3};
     BYTE rgb[sizeof(header) + 3 + TELVANE_ACTIVITY_EVENT_TRAILER] = {};
@@ -45,74 +41,61 @@ TEST_F(CoreStop, WithClientsInTheMiddleOfAnEvent)
     EXPECT_EQ(S_OK, client->Pipe().WriteMessage(rgb, sizeof(rgb), c_dwWaitMs));
     ASSERT_TRUE(m_trace.WaitFor("CServiceActivity::IncomingMessage() - MULTIPART"));
     Stop();
-    std::vector<DeliveredLog> rgLogs = LogsOf(logId);
-    ASSERT_EQ(1u, rgLogs.size());
-    EXPECT_TRUE((*rgLogs[0].doc)["LogEnd"].GetBool());
-    EXPECT_EQ((std::vector<std::string>{"\"whole\""}), GroupValues(*rgLogs[0].doc, eventId));
+    EXPECT_EQ((std::vector<std::string>{"\"whole\""}), OnlyLogValues(logId, eventId));
 }
 
+// The collection ends with no content when the stop closes the collector's pipe, whether its
+// operation still runs or was retired by a second start of its activity.
 TEST_F(CoreStop, WithACollectionOutstanding)
 {
-    GUID collectorId = NewGuid();
-    CCollectorThread collector(m_wstrCollectorPipe, collectorId, "\"late\"");
-    ASSERT_TRUE(collector.WaitRegistered());
-    ASSERT_TRUE(m_trace.WaitFor("TelvaneService::ReportConnectedCollector()", 1));
-    collector.Hold();
-    GUID logId = NewGuid();
-    GUID eventId = NewGuid();
-    std::unique_ptr<CActivityClient> client = StartActivity(NewGuid(), logId);
-    EXPECT_EQ(S_OK, client->SendEvent(eventId, "1", 1));
-    ASSERT_TRUE(collector.WaitRequests(1));
-    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", 1));
-    Stop();
-    // The collection ended with no content when the collector's pipe was closed.
-    EXPECT_EQ(1u, m_trace.Count("CServiceCollector::PipeBroken  - ERROR, the pipe was broken "
-                                "during a collection - sending an error response"));
-    std::vector<DeliveredLog> rgLogs = LogsOf(logId);
-    ASSERT_EQ(1u, rgLogs.size());
-    EXPECT_EQ((std::vector<std::string>{"1"}), GroupValues(*rgLogs[0].doc, eventId));
-    EXPECT_TRUE(GroupValues(*rgLogs[0].doc, collectorId).empty());
-}
-
-TEST_F(CoreStop, WithARetiringOperationDraining)
-{
-    GUID collectorId = NewGuid();
-    CCollectorThread collector(m_wstrCollectorPipe, collectorId, "\"late\"");
-    ASSERT_TRUE(collector.WaitRegistered());
-    ASSERT_TRUE(m_trace.WaitFor("TelvaneService::ReportConnectedCollector()", 1));
-    collector.Hold();
-    GUID activityId = NewGuid();
-    GUID logFirst = NewGuid();
-    std::unique_ptr<CActivityClient> first = StartActivity(activityId, logFirst);
-    EXPECT_EQ(S_OK, first->SendEvent(NewGuid(), "1", 1));
-    ASSERT_TRUE(collector.WaitRequests(1));
-    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", 1));
-    // The second start retires the first operation, which still waits for its collection.
-    std::unique_ptr<CActivityClient> second = StartActivity(activityId, NewGuid());
-    WaitForStarts(2);
-    Stop();
-    EXPECT_EQ(1u, LogsOf(logFirst).size());
+    for (bool fRetired : {false, true})
+    {
+        SCOPED_TRACE(fRetired ? "retired operation" : "running operation");
+        if (fRetired)
+        {
+            m_pService.reset(new CTestCoordinator());
+            m_pService->StartAndWait();
+            m_fStopped = false;
+            m_trace.Clear();
+        }
+        GUID collectorId = NewGuid();
+        std::unique_ptr<CCollectorThread> collector = StartCollector(collectorId, "\"late\"", true);
+        GUID activityId = NewGuid();
+        GUID logId = NewGuid();
+        GUID eventId = NewGuid();
+        std::unique_ptr<CActivityClient> client = StartActivity(activityId, logId);
+        SendEvent(*client, eventId, "1");
+        ASSERT_TRUE(collector->WaitRequests(1));
+        ASSERT_TRUE(m_trace.WaitFor(c_szActivityEvent, 1));
+        std::unique_ptr<CActivityClient> second;
+        if (fRetired)
+        {
+            second = StartActivity(activityId, NewGuid());
+            WaitForStarts(2);
+        }
+        Stop();
+        EXPECT_EQ(1u, m_trace.Count(c_szCollectorBroken));
+        EXPECT_EQ((std::vector<std::string>{"1"}), OnlyLogValues(logId, eventId));
+        EXPECT_TRUE(GroupValues(*WaitForLogs(logId, 1)[0].doc, collectorId).empty());
+    }
 }
 
 TEST_F(CoreStop, WithAHundredClientsConnected)
 {
-    const size_t cActivities = 100;
     std::vector<std::unique_ptr<CCollectorThread>> rgCollectors;
     for (int i = 0; i < 5; i++)
     {
-        rgCollectors.emplace_back(new CCollectorThread(m_wstrCollectorPipe, NewGuid(), "0"));
-        ASSERT_TRUE(rgCollectors.back()->WaitRegistered());
+        rgCollectors.push_back(StartCollector(NewGuid(), "0"));
     }
     std::vector<GUID> rgLogIds;
     std::vector<std::unique_ptr<CActivityClient>> rgClients;
-    GUID eventId = NewGuid();
-    for (size_t i = 0; i < cActivities; i++)
+    for (size_t i = 0; i < 100; i++)
     {
         rgLogIds.push_back(NewGuid());
         rgClients.push_back(StartActivity(NewGuid(), rgLogIds.back()));
-        EXPECT_EQ(S_OK, rgClients.back()->SendEvent(eventId, "1", 1));
+        SendEvent(*rgClients.back(), NewGuid(), "1");
     }
-    ASSERT_TRUE(m_trace.WaitFor("CServiceOperation::ActivityEvent()", cActivities));
+    ASSERT_TRUE(m_trace.WaitFor(c_szActivityEvent, rgLogIds.size()));
     Stop();
     for (const GUID &logId : rgLogIds)
     {
@@ -132,14 +115,14 @@ TEST_F(CoreStop, WhileClientsKeepArriving)
             while (!fStop)
             {
                 CActivityClient client(2000);
-                if (SUCCEEDED(client.Connect(m_wstrActivityPipe.c_str())) &&
+                if (SUCCEEDED(client.Connect(ActivityPipe().c_str())) &&
                     SUCCEEDED(client.Start(NewGuid(), NewGuid())))
                 {
                     client.SendEvent(NewGuid(), "1", 1);
                 }
                 client.Close();
                 CCollectorClient collector(2000);
-                if (SUCCEEDED(collector.Connect(m_wstrCollectorPipe.c_str())))
+                if (SUCCEEDED(collector.Connect(CollectorPipe().c_str())))
                 {
                     collector.Register(NewGuid());
                 }

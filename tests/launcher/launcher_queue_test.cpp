@@ -3,10 +3,7 @@
 // backlight notification's own callback thread, which then ends its own subscription.
 #include "tests/launcher/launchertestsupport.h"
 #include "service/cudptestlauncher.h"
-#include "service/statesubscription.h"
-#include "tests/common/testsupport.h"
 
-#include <gtest/gtest.h>
 #include <thread>
 
 using namespace launchertest;
@@ -52,27 +49,14 @@ private:
     DWORD m_dwHeldThread = 0;
 };
 
-class LauncherQueueTest : public ::testing::Test
+class LauncherQueueTest : public CLauncherTest
 {
 protected:
     void SetUp() override
     {
-        PreparePrefix();
-        PolicyFile policy;
-        policy.strRelayPort = "47320";
-        WritePolicyFile(policy);
+        CLauncherTest::SetUp();
+        WritePolicyFile({{"RelayPort", "47320"}});
     }
-    void TearDown() override
-    {
-        CleanupPrefix();
-        for (const std::wstring &wstrLine : m_failures.Lines())
-        {
-            ADD_FAILURE() << testsupport::Narrow(wstrLine);
-        }
-    }
-
-    testsupport::FailureCapture m_failures;
-    udptest::TraceSession m_trace;
 };
 
 // The notification was on its way when the destroy request came; with every gate open it
@@ -113,7 +97,7 @@ TEST_F(LauncherQueueTest, DestroyEndsSubscriptionFromInsideItsCallback)
     launcher.WaitForDestroyComplete();
 
     EXPECT_EQ(nullptr, *launcher.SubscriptionSlot());
-    EXPECT_EQ(1u, CountLines(m_trace, c_szCallbackToggled));
+    EXPECT_EQ(1u, m_trace.CountLines(c_szCallbackToggled));
     EXPECT_TRUE(m_trace.Contains(c_szFinishedDestruction));
 }
 } // namespace

@@ -1,61 +1,42 @@
 // The launcher inside a running coordinator: the backlight published through the state
 // facility, the policy file in the prefix, the Wi-Fi and chamber stand-ins, the installed test
 // application against a loopback relay, and the coordinator's stop.
-#include "tests/core/coretestsupport.h"
 #include "tests/launcher/launchertestsupport.h"
+#include "platform/endpointdirectory/endpointdirectory.h"
 #include "platform/securityruntime/securityruntime.h"
 #include "platform/wifi/wifiuser.h"
 #include "service/udptestpolicy.h"
-#include "platform/endpointdirectory/endpointdirectory.h"
+#include "tests/common/coordinator.h"
 #include "tests/common/policyserver.h"
+#include "tests/common/udpsupport.h"
 
-#include <gtest/gtest.h>
+#include <functional>
 #include <memory>
 
 using namespace launchertest;
 
 namespace
 {
-const wchar_t c_wszTestApplication[] = L"C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe";
+const ULONGLONG c_ullDay = 864000000000ull; // in the policy's 100 ns units
 
-class LauncherServiceTest : public ::testing::Test
+// The coordinator is the test thread's, started and stopped by the test.
+class LauncherServiceTest : public CLauncherTest
 {
 protected:
-    void SetUp() override
-    {
-        PreparePrefix();
-        RestartTrace();
-    }
-
-    // Forgets what was traced so far.
-    void RestartTrace()
-    {
-        m_pTrace.reset();
-        m_pTrace.reset(new udptest::TraceSession());
-    }
-
     void TearDown() override
     {
         StopService();
-        CleanupPrefix();
-        for (const std::wstring &wstrLine : m_failures.Lines())
-        {
-            ADD_FAILURE() << testsupport::Narrow(wstrLine);
-        }
+        CLauncherTest::TearDown();
     }
 
     // A coordinator as the shell runs it, on pipe names of its own, with the backlight
     // subscription's first delivery (the value 1 the prefix was left with) handled.
     void StartService()
     {
-        m_wstrActivityPipe = pipetest::UniquePipeName(L"launchact");
-        m_wstrCollectorPipe = pipetest::UniquePipeName(L"launchcol");
-        m_pService.reset(new coretest::CTestCoordinator(m_wstrActivityPipe.c_str(),
-                                                        m_wstrCollectorPipe.c_str()));
-        size_t cToggled = CountLines(*m_pTrace, c_szHandlerToggled);
-        m_pService->OnStart();
-        ASSERT_TRUE(WaitUntil([&] { return m_pService->State() == SERVICE_RUNNING; }));
-        ASSERT_TRUE(WaitForLine(*m_pTrace, c_szHandlerToggled, cToggled + 1))
+        m_pService.reset(new CTestCoordinator());
+        size_t cToggled = m_trace.CountLines(c_szHandlerToggled);
+        m_pService->StartAndWait();
+        ASSERT_TRUE(m_trace.WaitForLine(c_szHandlerToggled, cToggled + 1))
             << "no backlight subscription: is the platform component registered?";
     }
 
@@ -64,83 +45,88 @@ protected:
     {
         if (m_pService != nullptr)
         {
-            m_pService->OnStop();
-            EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), m_pService->State());
+            m_pService->StopAndCheckDrained();
             m_pService.reset();
         }
     }
 
     // Publishes a backlight change and waits until the launcher's handler saw it.
+    void ToggleBacklight(const std::vector<BYTE> &vbData)
+    {
+        size_t cToggled = m_trace.CountLines(c_szHandlerToggled);
+        Publish(c_ullBacklightStateName, vbData);
+        ASSERT_TRUE(m_trace.WaitForLine(c_szHandlerToggled, cToggled + 1));
+    }
     void ToggleBacklight(DWORD dwValue)
     {
-        size_t cToggled = CountLines(*m_pTrace, c_szHandlerToggled);
-        PublishBacklight(dwValue);
-        ASSERT_TRUE(WaitForLine(*m_pTrace, c_szHandlerToggled, cToggled + 1));
+        ToggleBacklight(std::vector<BYTE>{static_cast<BYTE>(dwValue), 0, 0, 0});
     }
 
-    std::wstring ExpectedCommandLine(const std::string &strArguments)
+    // An open policy for a loopback relay on usPort that echoes cPackets, the service started
+    // and the backlight changed: returns once the test application was launched.
+    void LaunchAgainstRelay(USHORT usPort, unsigned cPackets)
     {
-        return std::wstring(c_wszTestApplication) + L" " +
-               std::wstring(strArguments.begin(), strArguments.end());
+        WritePolicyFile(
+            {{"RelayPort", std::to_string(usPort)}, {"NumPackets", std::to_string(cPackets)}});
+        m_pRelay.reset(new CRelayProcess(usPort, L"-packets " + std::to_wstring(cPackets)));
+        ASSERT_TRUE(m_pRelay->Listening());
+        StartService();
+        ToggleBacklight(0);
+        ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
     }
 
-    testsupport::FailureCapture m_failures;
-    std::unique_ptr<udptest::TraceSession> m_pTrace;
-    std::wstring m_wstrActivityPipe;
-    std::wstring m_wstrCollectorPipe;
-    std::unique_ptr<coretest::CTestCoordinator> m_pService;
+    // The relay's report once the application sent all it was to send.
+    static std::string Echoed(unsigned cPackets)
+    {
+        return "received " + std::to_string(cPackets) + " echoed " + std::to_string(cPackets) +
+               " end packets\n";
+    }
+
+    static std::wstring CommandLine(const std::string &strArguments)
+    {
+        return std::wstring(c_wszTestAppPath) + L" " + Widen(strArguments);
+    }
+
+    std::unique_ptr<CTestCoordinator> m_pService;
+    std::unique_ptr<CRelayProcess> m_pRelay;
 };
+} // namespace
 
 TEST_F(LauncherServiceTest, BacklightChangeRunsTestAgainstRelay)
 {
-    const USHORT usPort = 47301;
-    PolicyFile policy;
-    policy.strRelayPort = std::to_string(usPort);
-    WritePolicyFile(policy);
-    testsupport::CRelayProcess relay(usPort, L"-packets 20");
-    ASSERT_TRUE(relay.Listening());
     DWORD cLaunches = ChamberLaunchCount();
-    StartService();
-
     ULONGLONG ullBefore = UdpConfigNow();
-    ToggleBacklight(0);
-    ASSERT_TRUE(WaitForLine(*m_pTrace, c_szLaunched));
+    LaunchAgainstRelay(47301, 20);
     EXPECT_EQ(cLaunches + 1, ChamberLaunchCount());
     const std::string strArguments = "-localIP 127.0.0.1 -count 20 127.0.0.1 47301";
-    EXPECT_EQ(ExpectedCommandLine(strArguments), ChamberLastCommandLine());
-    EXPECT_TRUE(
-        m_pTrace->Contains("2008|C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe " + strArguments));
-    EXPECT_TRUE(m_pTrace->Contains(c_szLoadingConfig));
+    EXPECT_EQ(CommandLine(strArguments), ChamberLastCommandLine());
+    EXPECT_TRUE(m_trace.Contains("2008|" + Narrow(CommandLine(strArguments))));
+    EXPECT_TRUE(m_trace.Contains(c_szLoadingConfig));
 
-    EXPECT_EQ("received 20 echoed 20 end packets\n", relay.WaitForReport());
-    ASSERT_TRUE(WaitUntil([] { return !testsupport::ResultFiles().empty(); }));
-    std::string strResult;
-    ASSERT_TRUE(udptest::ReadWholeFile(testsupport::ResultFiles()[0], &strResult));
+    EXPECT_EQ(Echoed(20), m_pRelay->WaitForReport());
+    ASSERT_TRUE(WaitUntil([] { return !ResultFiles().empty(); }));
+    std::string strResult = ReadFileText(ResultFiles()[0]);
     EXPECT_NE(std::string::npos, strResult.find("\"Received\":20")) << strResult;
 
     // The start is remembered in the saved policy, with the rest of it unchanged.
-    std::string strSaved = ReadPolicyFile();
+    std::string strSaved = ReadFileText(c_wszUdpConfigFile);
     size_t ichLastTest = strSaved.find("\"LastTest\":");
     ASSERT_NE(std::string::npos, ichLastTest) << strSaved;
-    unsigned long long ullLastTest = std::stoull(strSaved.substr(ichLastTest + 11));
-    EXPECT_LE(ullBefore, ullLastTest);
+    EXPECT_LE(ullBefore, std::stoull(strSaved.substr(ichLastTest + 11)));
     EXPECT_NE(std::string::npos, strSaved.find("\"RelayPort\":47301,")) << strSaved;
 
     StopService();
-    EXPECT_TRUE(m_pTrace->Contains(c_szFinishedDestruction));
+    EXPECT_TRUE(m_trace.Contains(c_szFinishedDestruction));
 }
 
 // A value of 1 does nothing beyond the two trace lines; any other value, and data too short to
-// hold a value, runs the checks (here the policy's "Not enabled").
+// hold a value, runs the checks (here the policy's "Not enabled"). After the stop the launcher
+// no longer hears the backlight.
 TEST_F(LauncherServiceTest, BacklightValuesAndShortData)
 {
-    PolicyFile policy;
-    policy.strEnabled = "false";
-    policy.strRelayPort = "47302";
-    WritePolicyFile(policy);
+    WritePolicyFile({{"Enabled", "false"}});
     StartService();
-
-    struct
+    const struct
     {
         std::vector<BYTE> vbData;
         bool fChecks;
@@ -152,89 +138,62 @@ TEST_F(LauncherServiceTest, BacklightValuesAndShortData)
     size_t cChecks = 0;
     for (const auto &c : rgCases)
     {
-        size_t cToggled = CountLines(*m_pTrace, c_szHandlerToggled);
-        PublishBacklight(c.vbData);
-        ASSERT_TRUE(WaitForLine(*m_pTrace, c_szHandlerToggled, cToggled + 1));
+        ToggleBacklight(c.vbData);
         if (c.fChecks)
         {
             cChecks++;
-            ASSERT_TRUE(WaitForLine(*m_pTrace, c_szNotAsked, cChecks)) << c.vbData.size();
+            ASSERT_TRUE(m_trace.WaitForLine(c_szNotAsked, cChecks)) << c.vbData.size();
         }
     }
     StopService(); // drains the launcher's queue: nothing more is on its way
-    EXPECT_EQ(cChecks, CountLines(*m_pTrace, c_szNotAsked));
-    EXPECT_EQ(cChecks, CountLines(*m_pTrace, "2001|Not enabled|0"));
-    EXPECT_EQ(1u, CountLines(*m_pTrace, c_szLoadingConfig)); // the file is read once
+    EXPECT_EQ(cChecks, m_trace.CountLines(c_szNotAsked));
+    EXPECT_EQ(cChecks, m_trace.CountLines("2001|Not enabled|0"));
+    EXPECT_EQ(1u, m_trace.CountLines(c_szLoadingConfig)); // the file is read once
+    EXPECT_EQ(1u, m_trace.CountLines(c_szFinishedDestruction));
+
+    size_t cCallbacks = m_trace.CountLines(c_szCallbackToggled);
+    Publish(c_ullBacklightStateName, 0);
+    Sleep(200);
+    EXPECT_EQ(cCallbacks, m_trace.CountLines(c_szCallbackToggled));
 }
 
-// A change while the test application runs is ignored; so is a change that comes after the
-// policy could not be saved, since the process is tracked anyway.
-TEST_F(LauncherServiceTest, ChangeWhileTestRunsIsIgnored)
+// While the test application runs, changes are ignored and a stop waits for it to end by
+// itself; so too after the policy could not be saved, since the process is tracked anyway.
+TEST_F(LauncherServiceTest, RunningTestIgnoresChangesAndHoldsTheStop)
 {
-    struct
+    const struct
     {
         const char *szName;
         bool fSaveFails;
-    } rgCases[] = {{"saved", false}, {"save failed", true}};
-    USHORT usPort = 47303;
+        USHORT usPort;
+    } rgCases[] = {{"saved", false, 47303}, {"save failed", true, 47304}};
     for (const auto &c : rgCases)
     {
         SCOPED_TRACE(c.szName);
         PreparePrefix();
-        RestartTrace();
-        PolicyFile policy;
-        policy.strRelayPort = std::to_string(usPort);
-        policy.strNumPackets = "150"; // three seconds of sending
-        WritePolicyFile(policy);
+        m_trace.Clear();
         if (c.fSaveFails)
         {
             // A folder where the new policy would be written makes every save fail.
             ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr));
         }
-        testsupport::CRelayProcess relay(usPort, L"-packets 150");
-        ASSERT_TRUE(relay.Listening());
         DWORD cLaunches = ChamberLaunchCount();
-        StartService();
-
-        ToggleBacklight(0);
-        ASSERT_TRUE(WaitForLine(*m_pTrace, c_szLaunched));
-        EXPECT_EQ(c.fSaveFails, m_pTrace->Contains("2001|CreateFile (write)|80070005"))
+        LaunchAgainstRelay(c.usPort, 250); // five seconds of sending
+        EXPECT_EQ(c.fSaveFails, m_trace.Contains("2001|CreateFile (write)|80070005"))
             << "the failed save is traced";
-        ASSERT_TRUE(testsupport::ResultFiles().empty()) << "the test ended before the next change";
+        ASSERT_TRUE(ResultFiles().empty()) << "the test ended before the next change";
         ToggleBacklight(0);
         ToggleBacklight(2);
-        EXPECT_EQ(2u, CountLines(*m_pTrace, c_szStillRunning));
-        EXPECT_EQ(cLaunches + 1, ChamberLaunchCount());
+        EXPECT_EQ(2u, m_trace.CountLines(c_szStillRunning));
 
-        EXPECT_EQ("received 150 echoed 150 end packets\n", relay.WaitForReport());
         StopService();
+        // The application writes its result as it ends: the stop came back only after that.
+        EXPECT_EQ(1u, ResultFiles().size());
+        EXPECT_TRUE(m_trace.Contains(c_szStillWaiting));
+        EXPECT_TRUE(m_trace.Contains(c_szFinishedDestruction));
+        EXPECT_EQ(Echoed(250), m_pRelay->WaitForReport());
         EXPECT_EQ(cLaunches + 1, ChamberLaunchCount());
-        EXPECT_EQ(1u, testsupport::ResultFiles().size());
-        usPort++;
     }
-}
-
-// Stopping the service while the test application runs waits for it to end by itself.
-TEST_F(LauncherServiceTest, StopWhileTestRunsCompletesAfterTestExits)
-{
-    const USHORT usPort = 47306;
-    PolicyFile policy;
-    policy.strRelayPort = std::to_string(usPort);
-    policy.strNumPackets = "250"; // five seconds of sending
-    WritePolicyFile(policy);
-    testsupport::CRelayProcess relay(usPort, L"-packets 250");
-    ASSERT_TRUE(relay.Listening());
-    StartService();
-
-    ToggleBacklight(0);
-    ASSERT_TRUE(WaitForLine(*m_pTrace, c_szLaunched));
-    ASSERT_TRUE(testsupport::ResultFiles().empty()) << "the test ended before the stop";
-    StopService();
-    // The application writes its result as it ends: the stop came back only after that.
-    EXPECT_EQ(1u, testsupport::ResultFiles().size());
-    EXPECT_TRUE(m_pTrace->Contains(c_szStillWaiting));
-    EXPECT_TRUE(m_pTrace->Contains(c_szFinishedDestruction));
-    EXPECT_EQ("received 250 echoed 250 end packets\n", relay.WaitForReport());
 }
 
 // An expired policy is fetched from the web service, with the device certificate, before the
@@ -242,224 +201,147 @@ TEST_F(LauncherServiceTest, StopWhileTestRunsCompletesAfterTestExits)
 TEST_F(LauncherServiceTest, ExpiredPolicyIsRefreshedFromWebService)
 {
     const USHORT usServerPort = 47330;
-    const USHORT usRelayPort = 47331;
-    PolicyFile policy;
-    policy.strEnabled = "false";
-    policy.strRelayPort = "47399";
-    policy.strExpiration = std::to_string(UdpConfigNow() - 10000000); // a second ago
-    WritePolicyFile(policy);
+    WritePolicyFile({{"Enabled", "false"},
+                     {"RelayPort", "47399"},
+                     {"Expiration", std::to_string(UdpConfigNow() - 10000000)}}); // a second ago
     PolicyServerOptions options;
     options.usPort = usServerPort;
     options.fUseBody = true;
-    options.strBody = "{\"Enabled\":\"true\",\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":" +
-                      std::to_string(usRelayPort) +
-                      ",\"NumPackets\":10,\"MaxTestDay\":24,\"Policy\":\"BattAC\","
+    options.strBody = "{\"Enabled\":\"true\",\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":47331,"
+                      "\"NumPackets\":10,\"MaxTestDay\":24,\"Policy\":\"BattAC\","
                       "\"DurationValid\":\"P1D\"}";
     CTestPolicyServer server;
     ASSERT_TRUE(server.Start(options));
-    std::wstring wstrEndpoint = L"https://localhost:" + std::to_wstring(usServerPort) + L"/";
-    ASSERT_EQ(ERROR_SUCCESS,
-              RegSetKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                              REG_SZ, wstrEndpoint.c_str(),
-                              static_cast<DWORD>((wstrEndpoint.size() + 1) * sizeof(wchar_t))));
-    PublishPowerSource(1); // the answer allows battery power
-    testsupport::CRelayProcess relay(usRelayPort, L"-packets 10");
+    HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
+                  L"https://localhost:" + std::to_wstring(usServerPort) + L"/");
+    Publish(c_ullPowerSourceStateName, 1); // the answer allows battery power
+    CRelayProcess relay(47331, L"-packets 10");
     ASSERT_TRUE(relay.Listening());
     StartService();
 
     ULONGLONG ullBefore = UdpConfigNow();
     ToggleBacklight(0);
-    ASSERT_TRUE(WaitForLine(*m_pTrace, c_szLaunched));
+    ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
     ULONGLONG ullAfter = UdpConfigNow();
-    EXPECT_EQ("received 10 echoed 10 end packets\n", relay.WaitForReport());
-    EXPECT_EQ(ExpectedCommandLine("-localIP 127.0.0.1 -count 10 127.0.0.1 47331"),
+    EXPECT_EQ(Echoed(10), relay.WaitForReport());
+    EXPECT_EQ(CommandLine("-localIP 127.0.0.1 -count 10 127.0.0.1 47331"),
               ChamberLastCommandLine());
     std::vector<std::string> rgRequests = server.Requests();
     ASSERT_EQ(1u, rgRequests.size());
     EXPECT_NE(std::string::npos, rgRequests[0].find("/v1/api/config/udpecho")) << rgRequests[0];
-    EXPECT_TRUE(m_pTrace->Contains("2005")) << "refreshed";
-    EXPECT_FALSE(m_pTrace->Contains(c_szConfigExpired)) << "refreshed once, at the first load";
+    EXPECT_EQ(1u, m_trace.CountLines("2005")) << "refreshed";
+    EXPECT_FALSE(m_trace.Contains(c_szConfigExpired)) << "refreshed once, at the first load";
 
     // The saved policy holds the answer with its absolute expiration, a day after the fetch.
-    std::string strSaved = ReadPolicyFile();
+    std::string strSaved = ReadFileText(c_wszUdpConfigFile);
     EXPECT_EQ(0u, strSaved.find("{\"Enabled\":true,\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":47331,"
                                 "\"Expiration\":"))
         << strSaved;
     unsigned long long ullExpiration =
         std::stoull(strSaved.substr(strSaved.find("\"Expiration\":") + 13));
-    EXPECT_LE(ullBefore + 864000000000ull, ullExpiration);
-    EXPECT_GE(ullAfter + 864000000000ull, ullExpiration);
+    EXPECT_LE(ullBefore + c_ullDay, ullExpiration);
+    EXPECT_GE(ullAfter + c_ullDay, ullExpiration);
     EXPECT_NE(std::string::npos, strSaved.find(",\"Policy\":\"BattAC\"}")) << strSaved;
 }
 
 // Every gate that refuses, and every launch step that fails, traces why and starts nothing.
-struct RefusalCase
+TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
 {
-    const char *szName;
-    bool fPolicyFile;                            // false: no policy file at all
-    std::function<void(PolicyFile *)> pfnPolicy; // changes the open policy
-    std::function<void()> pfnPrefix;             // changes the open prefix
-    std::vector<std::string> rgExpected;         // trace lines, in this order
-};
-
-const std::vector<RefusalCase> &RefusalCases()
-{
-    static const std::vector<RefusalCase> s_rgCases = {
-        {"disabled",
-         true,
-         [](PolicyFile *p) { p->strEnabled = "false"; },
-         nullptr,
-         {"2001|Not enabled|0"}},
-        {"enabled as text",
-         true,
-         [](PolicyFile *p) { p->strEnabled = "\"yes\""; },
-         nullptr,
-         {"2001|Not enabled|0"}},
+    const std::string strOneHourAgo = std::to_string(UdpConfigNow() - c_ullDay / 24);
+    const std::string strLongRelay = "\"" + std::string(220, 'r') + "\"";
+    auto power = [](std::vector<BYTE> vbData) {
+        return [=] { Publish(c_ullPowerSourceStateName, vbData); };
+    };
+    auto wifiFails = [](const wchar_t *wszCall) {
+        return [=] { WiFiStandInSetFailure(wszCall, c_hrWiFiStandInFailure); };
+    };
+    auto chamberFails = [](const wchar_t *wszCall) {
+        return [=] { ChamberStandInSetFailure(wszCall, CHAMBER_STANDIN_FAILURE); };
+    };
+    const char szNotEnabled[] = "2001|Not enabled|0";
+    const char szNoRelay[] = "2001|No relay to test against|0";
+    const char szNoWiFi[] = "2001|We dont have active WiFi|0";
+    const char szNotTime[] = "2001|Not time to run|0";
+    const char szNotOnAc[] = "2001|Not on AC, it's required|0";
+    const struct
+    {
+        const char *szName;
+        PolicyMembers policy;                // replaces members of the open policy
+        std::function<void()> pfnPrefix;     // changes the open prefix
+        std::vector<std::string> rgExpected; // the failure lines, in this order
+    } rgCases[] = {
+        {"disabled", {{"Enabled", "false"}}, nullptr, {szNotEnabled}},
+        {"enabled as text", {{"Enabled", "\"yes\""}}, nullptr, {szNotEnabled}},
         // The reader gives a saved empty name back as null.
-        {"empty relay",
-         true,
-         [](PolicyFile *p) { p->strRelay = "\"\""; },
-         nullptr,
-         {"2001|No relay to test against|0"}},
-        {"relay null",
-         true,
-         [](PolicyFile *p) { p->strRelay = "\"null\""; },
-         nullptr,
-         {"2001|No relay to test against|0"}},
-        {"relay port 0",
-         true,
-         [](PolicyFile *p) { p->strRelayPort = "0"; },
-         nullptr,
-         {"2001|No relay to test against|0"}},
-        {"relay port not a number",
-         true,
-         [](PolicyFile *p) { p->strRelayPort = "\"x47310\""; },
-         nullptr,
-         {"2001|No relay to test against|0"}},
-        {"on battery",
-         true,
-         nullptr,
-         [] { PublishPowerSource(1); },
-         {"2001|Not on AC, it's required|0"}},
-        {"power state too short",
-         true,
-         nullptr,
-         [] {
-             PublishPowerSource(std::vector<BYTE>{0, 0});
-         },
-         {"2001|Not on AC, it's required|0"}},
+        {"empty relay", {{"RelayFQDN", "\"\""}}, nullptr, {szNoRelay}},
+        {"relay null", {{"RelayFQDN", "\"null\""}}, nullptr, {szNoRelay}},
+        {"relay port 0", {{"RelayPort", "0"}}, nullptr, {szNoRelay}},
+        {"relay port not a number", {{"RelayPort", "\"x47310\""}}, nullptr, {szNoRelay}},
+        {"on battery", {}, power({1, 0, 0, 0}), {szNotOnAc}},
+        {"power state too short", {}, power({0, 0}), {szNotOnAc}},
         {"battery allowed, no Wi-Fi",
-         true,
-         [](PolicyFile *p) { p->strPolicy = "\"BattAC\""; },
-         [] {
-             PublishPowerSource(1);
+         {{"Policy", "\"BattAC\""}},
+         [=] {
+             power({1, 0, 0, 0})();
              WiFiStandInSetDisconnected();
          },
-         {"2001|We dont have active WiFi|0"}},
-        {"Wi-Fi disconnected",
-         true,
-         nullptr,
-         [] { WiFiStandInSetDisconnected(); },
-         {"2001|We dont have active WiFi|0"}},
+         {szNoWiFi}},
+        {"Wi-Fi disconnected", {}, [] { WiFiStandInSetDisconnected(); }, {szNoWiFi}},
         {"Wi-Fi handle fails",
-         true,
-         nullptr,
-         [] { WiFiStandInSetFailure(L"OpenHandle", c_hrWiFiStandInFailure); },
-         {"2001|WiFiUserHandle::OpenHandle|80070015", "2001|We dont have active WiFi|0"}},
+         {},
+         wifiFails(L"OpenHandle"),
+         {"2001|WiFiUserHandle::OpenHandle|80070015", szNoWiFi}},
         {"Wi-Fi state fails",
-         true,
-         nullptr,
-         [] { WiFiStandInSetFailure(L"QueryConnectionState", c_hrWiFiStandInFailure); },
-         {"2001|QueryConnectionState|80070015", "2001|We dont have active WiFi|0"}},
+         {},
+         wifiFails(L"QueryConnectionState"),
+         {"2001|QueryConnectionState|80070015", szNoWiFi}},
         {"Wi-Fi adapter fails",
-         true,
-         nullptr,
-         [] { WiFiStandInSetFailure(L"QueryAdapterInfo", c_hrWiFiStandInFailure); },
-         {"2001|QueryAdapterInfo|80070015", "2001|We dont have active WiFi|0"}},
-        {"tested an hour ago",
-         true,
-         [](PolicyFile *p) { p->strLastTest = std::to_string(UdpConfigNow() - 36000000000ull); },
-         nullptr,
-         {"2001|Not time to run|0"}},
-        {"no tests a day",
-         true,
-         [](PolicyFile *p) {
-             p->strLastTest = "1";
-             p->strMaxTestDay = "0";
-         },
-         nullptr,
-         {"2001|Not time to run|0"}},
-        {"negative tests a day",
-         true,
-         [](PolicyFile *p) {
-             p->strLastTest = "1";
-             p->strMaxTestDay = "-2";
-         },
-         nullptr,
-         {"2001|Not time to run|0"}},
+         {},
+         wifiFails(L"QueryAdapterInfo"),
+         {"2001|QueryAdapterInfo|80070015", szNoWiFi}},
+        {"tested an hour ago", {{"LastTest", strOneHourAgo}}, nullptr, {szNotTime}},
+        {"no tests a day", {{"LastTest", "1"}, {"MaxTestDay", "0"}}, nullptr, {szNotTime}},
+        {"negative tests a day", {{"LastTest", "1"}, {"MaxTestDay", "-2"}}, nullptr, {szNotTime}},
         {"tests a day not a number",
-         true,
-         [](PolicyFile *p) {
-             p->strLastTest = "1";
-             p->strMaxTestDay = "\"often\"";
-         },
+         {{"LastTest", "1"}, {"MaxTestDay", "\"often\""}},
          nullptr,
-         {"2001|Not time to run|0"}},
+         {szNotTime}},
         // The record is reset before the file is read, and the refresh brings nothing.
         {"no policy file",
-         false,
-         nullptr,
-         nullptr,
-         {"2001|CreateFile (read)|80070002", "2001|GetServiceEndpoint|80070002",
-          "2001|Not enabled|0"}},
+         {},
+         [] { DeleteFileW(c_wszUdpConfigFile); },
+         {"2001|CreateFile (read)|80070002", "2001|GetServiceEndpoint|80070002", szNotEnabled}},
         {"no chamber",
-         true,
-         nullptr,
-         [] { ChamberStandInSetFailure(L"GetChamberSidFromId", CHAMBER_STANDIN_FAILURE); },
+         {},
+         chamberFails(L"GetChamberSidFromId"),
          {"2001|GetChamberSidFromId|80070005"}},
         {"chamber refuses the process",
-         true,
-         nullptr,
-         [] { ChamberStandInSetFailure(L"CreateProcessInChamber", CHAMBER_STANDIN_FAILURE); },
+         {},
+         chamberFails(L"CreateProcessInChamber"),
          {"2001|CreateProcessInChamber|80070005"}},
         // The line would be cut, and a cut line tests against another relay or port.
         {"command line too long",
-         true,
-         [](PolicyFile *p) { p->strRelay = "\"" + std::string(220, 'r') + "\""; },
+         {{"RelayFQDN", strLongRelay}},
          nullptr,
          {"2001|StringCchPrintf|8007007a"}},
     };
-    return s_rgCases;
-}
-
-TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
-{
-    for (const RefusalCase &c : RefusalCases())
+    for (const auto &c : rgCases)
     {
         SCOPED_TRACE(c.szName);
         PreparePrefix();
-        PolicyFile policy;
-        policy.strRelayPort = "47310";
-        if (c.pfnPolicy)
-        {
-            c.pfnPolicy(&policy);
-        }
-        if (c.fPolicyFile)
-        {
-            WritePolicyFile(policy);
-        }
+        WritePolicyFile(c.policy);
         if (c.pfnPrefix)
         {
             c.pfnPrefix();
         }
         DWORD cLaunches = ChamberLaunchCount();
-        RestartTrace();
+        m_trace.Clear();
         StartService();
 
         ToggleBacklight(0);
         StopService(); // every handler has run when the launcher is destroyed
         std::vector<std::string> rgFailures;
-        for (const std::string &strLine : m_pTrace->Lines())
+        for (const std::string &strLine : m_trace.Lines())
         {
             if (strLine.compare(0, 5, "2001|") == 0)
             {
@@ -467,8 +349,7 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
             }
         }
         EXPECT_EQ(c.rgExpected, rgFailures);
-        EXPECT_FALSE(m_pTrace->Contains(c_szLaunched));
+        EXPECT_FALSE(m_trace.Contains(c_szLaunched));
         EXPECT_EQ(cLaunches, ChamberLaunchCount());
     }
 }
-} // namespace
