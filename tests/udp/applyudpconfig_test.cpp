@@ -1,6 +1,5 @@
 #include "lib/jsonreader.h"
 #include "service/udptestpolicy.h"
-#include "tests/udp/udptestsupport.h"
 
 #include <gtest/gtest.h>
 #include <memory>
@@ -142,14 +141,4 @@ TEST(ApplyUdpConfig, Table)
         EXPECT_EQ(c.ulRelayPort, config.relayPort);
         EXPECT_EQ(c.ulPackets, config.numPackets);
     }
-}
-
-TEST(ApplyUdpConfig, RefusedRelayNameIsTraced)
-{
-    udptest::TraceSession session;
-    std::unique_ptr<JsonValue> pRoot(
-        JsonReader::FromJsonString(R"({"RelayFQDN":"a;b","Expiration":1})"));
-    UdpTestConfig config = StartRecord();
-    EXPECT_EQ(E_INVALIDARG, ApplyUdpConfig(&config, static_cast<JsonObjectNode *>(pRoot.get())));
-    EXPECT_TRUE(session.Contains("2001|RelayFQDN|80070057"));
 }

@@ -3,12 +3,11 @@
 #include "platform/securityruntime/securityruntime.h"
 #include "platform/wifi/wifiuser.h"
 #include "tests/common/testsupport.h"
-#include "tests/udp/udptestsupport.h"
 
 #include <gtest/gtest.h>
 #include <sddl.h>
 
-using udptest::RunTelvanectl;
+using namespace testsupport;
 
 namespace
 {
@@ -52,6 +51,8 @@ WiFiAnswers AskWiFi()
     return answers;
 }
 
+// Runs on the test thread and owns the stand-ins' keys while it runs (the suite runs one test
+// at a time).
 class StandIns : public ::testing::Test
 {
 protected:
@@ -68,13 +69,14 @@ TEST_F(StandIns, WiFiAnswersWhatTelvanectlSet)
     const HRESULT hrDefault = c_hrWiFiStandInFailure;
     struct
     {
-        const wchar_t *wszCommand;
+        const wchar_t *wszCommand; // null: no state at all
         HRESULT hrOpen, hrState;
         WiFiConnectionState state;
         bool fNetwork;
         HRESULT hrAdapter;
         const wchar_t *wszAddress;
     } rgCases[] = {
+        {nullptr, S_OK, S_OK, WiFiConnectionStateDisconnected, false, S_OK, L""},
         {L"connected 10.1.2.3", S_OK, S_OK, WiFiConnectionStateConnected, true, S_OK, L"10.1.2.3"},
         {L"connected fe80::1234:5678a", S_OK, S_OK, WiFiConnectionStateConnected, true, S_OK,
          L"fe80::1234:5678a"}, // 16 characters fill the field, unterminated
@@ -86,10 +88,16 @@ TEST_F(StandIns, WiFiAnswersWhatTelvanectlSet)
     };
     for (const auto &c : rgCases)
     {
-        SCOPED_TRACE(testsupport::Narrow(c.wszCommand));
-        std::string strOutput;
-        ASSERT_EQ(0u, RunTelvanectl(std::wstring(L"platform wifi ") + c.wszCommand, &strOutput))
-            << strOutput;
+        SCOPED_TRACE(Narrow(c.wszCommand != nullptr ? c.wszCommand : L"no state"));
+        if (c.wszCommand == nullptr)
+        {
+            HklmDeleteKey(WIFI_STANDIN_KEY);
+        }
+        else
+        {
+            ChildResult result = RunTelvanectl(std::wstring(L"platform wifi ") + c.wszCommand);
+            ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
+        }
         WiFiAnswers answers = AskWiFi();
         EXPECT_EQ(c.hrOpen, answers.hrOpen);
         if (FAILED(c.hrOpen))
@@ -104,17 +112,8 @@ TEST_F(StandIns, WiFiAnswersWhatTelvanectlSet)
     }
     EXPECT_EQ(0, WiFiStandInLiveHandles());
     EXPECT_EQ(0, WiFiStandInLiveNetworks());
-}
-
-TEST_F(StandIns, WiFiWithoutStateIsDisconnected)
-{
-    RegDeleteKeyW(HKEY_LOCAL_MACHINE, WIFI_STANDIN_KEY);
-    WiFiAnswers answers = AskWiFi();
-    EXPECT_EQ(S_OK, answers.hrOpen);
-    EXPECT_EQ(WiFiConnectionStateDisconnected, answers.state);
-    EXPECT_FALSE(answers.fNetwork);
     WiFiUserHandle *pHandle = nullptr;
-    EXPECT_EQ(E_INVALIDARG, WiFiUserHandle::OpenHandle(2, &pHandle));
+    EXPECT_EQ(E_INVALIDARG, WiFiUserHandle::OpenHandle(2, &pHandle)); // another version
     EXPECT_EQ(nullptr, pHandle);
 }
 
@@ -133,8 +132,8 @@ TEST_F(StandIns, TelvanectlRefusesBadWiFiCommands)
     };
     for (const wchar_t *wszCommand : rgwszCommands)
     {
-        SCOPED_TRACE(testsupport::Narrow(wszCommand));
-        EXPECT_EQ(2u, RunTelvanectl(wszCommand));
+        SCOPED_TRACE(Narrow(wszCommand));
+        EXPECT_EQ(2u, RunTelvanectl(wszCommand).dwExitCode);
     }
 }
 
@@ -159,34 +158,28 @@ TEST_F(StandIns, ChamberSidIsStablePerName)
     EXPECT_EQ(E_INVALIDARG, GetChamberSidFromId(nullptr, &pSid));
 }
 
-TEST_F(StandIns, ChamberRefusesOtherSids)
+TEST_F(StandIns, ChamberStartsOnlyInChambersAndFailsWhenTelvanectlSaysSo)
 {
-    PSID pEveryone = nullptr;
-    ASSERT_TRUE(ConvertStringSidToSidW(L"S-1-1-0", &pEveryone));
     STARTUPINFOW si = {sizeof(si)};
     PROCESS_INFORMATION pi = {};
     wchar_t wszCommandLine[] = L"cmd.exe /c exit 0";
-    EXPECT_EQ(E_INVALIDARG, CreateProcessInChamber(pEveryone, L"{x}", nullptr, wszCommandLine,
-                                                   FALSE, 0, nullptr, &si, &pi));
-    LocalFree(pEveryone);
-}
-
-TEST_F(StandIns, ChamberFailuresSetThroughTelvanectl)
-{
-    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber fail GetChamberSidFromId"));
     PSID pSid = nullptr;
+    ASSERT_TRUE(ConvertStringSidToSidW(L"S-1-1-0", &pSid)); // Everyone is no chamber
+    EXPECT_EQ(E_INVALIDARG, CreateProcessInChamber(pSid, L"{x}", nullptr, wszCommandLine, FALSE, 0,
+                                                   nullptr, &si, &pi));
+    LocalFree(pSid);
+
+    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber fail GetChamberSidFromId").dwExitCode);
+    pSid = nullptr;
     EXPECT_EQ(CHAMBER_STANDIN_FAILURE, GetChamberSidFromId(L"ZoRiVirOruz", &pSid));
     EXPECT_EQ(nullptr, pSid);
 
-    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber fail CreateProcessInChamber"));
+    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber fail CreateProcessInChamber").dwExitCode);
     ASSERT_EQ(S_OK, GetChamberSidFromId(L"ZoRiVirOruz", &pSid));
-    STARTUPINFOW si = {sizeof(si)};
-    PROCESS_INFORMATION pi = {};
-    wchar_t wszCommandLine[] = L"cmd.exe /c exit 0";
     EXPECT_EQ(CHAMBER_STANDIN_FAILURE, CreateProcessInChamber(pSid, L"{x}", nullptr, wszCommandLine,
                                                               FALSE, 0, nullptr, &si, &pi));
 
-    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber ok"));
+    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber ok").dwExitCode);
     ASSERT_EQ(S_OK, CreateProcessInChamber(pSid, L"{x}", nullptr, wszCommandLine, FALSE,
                                            CREATE_NO_WINDOW, nullptr, &si, &pi));
     EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(pi.hProcess, 30000));
@@ -194,7 +187,8 @@ TEST_F(StandIns, ChamberFailuresSetThroughTelvanectl)
     CloseHandle(pi.hProcess);
     LocalFree(pSid);
 
-    std::string strOutput;
-    ASSERT_EQ(0u, RunTelvanectl(L"platform chamber last", &strOutput));
-    EXPECT_NE(std::string::npos, strOutput.find("LastCommandLine: cmd.exe /c exit 0")) << strOutput;
+    ChildResult result = RunTelvanectl(L"platform chamber last");
+    ASSERT_EQ(0u, result.dwExitCode);
+    EXPECT_NE(std::string::npos, result.strOutput.find("LastCommandLine: cmd.exe /c exit 0"))
+        << result.strOutput;
 }

@@ -4,23 +4,25 @@
 #include "platform/wifi/wifiuser.h"
 #include "service/udptestlaunch.h"
 #include "service/udptestpolicy.h"
-#include "tests/common/testsupport.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/tracesession.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
 #include <functional>
 
-using udptest::TraceSession;
+using namespace testsupport;
 
 namespace
 {
+// Runs on the test thread and owns the prefix's policy file, test application and stand-in
+// state while it runs (the suite runs one test at a time).
 class UdpTestLaunch : public ::testing::Test
 {
 protected:
     void SetUp() override
     {
-        testsupport::PreparePolicyFolder();
-        testsupport::InstallTestApplication();
+        PreparePolicyFolder();
+        InstallTestApplication();
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
     void TearDown() override
@@ -94,7 +96,7 @@ TEST_F(UdpTestLaunch, WiFiGate)
     {
         SCOPED_TRACE(c.szName);
         ASSERT_EQ(S_OK, c.set());
-        TraceSession session;
+        CTraceSession session;
         UdpTestConfig config;
         ResetUdpConfig(&config);
         EXPECT_EQ(c.fActive, UdpTestWiFiActive(&config));
@@ -107,10 +109,10 @@ TEST_F(UdpTestLaunch, WiFiGate)
 
 TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
 {
-    testsupport::CRelayProcess relay(47215);
+    CRelayProcess relay(47215);
     ASSERT_TRUE(relay.Listening());
     UdpTestConfig config = RelayConfig(47215);
-    TraceSession session;
+    CTraceSession session;
     uint64_t ullBefore = UdpConfigNow();
     HANDLE hProcess = INVALID_HANDLE_VALUE;
     EXPECT_EQ(S_OK, LaunchUdpTest(&config, &hProcess));
@@ -122,29 +124,51 @@ TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
     EXPECT_EQ(std::vector<std::string>({"2008|" + strCommandLine, "2007"}), session.Lines());
     EXPECT_LE(ullBefore, config.lastTest);
     EXPECT_GE(ullAfter, config.lastTest);
-    std::string strSaved;
-    ASSERT_TRUE(udptest::ReadWholeFile(c_wszUdpConfigFile, &strSaved));
-    EXPECT_NE(std::string::npos, strSaved.find("\"LastTest\":" + std::to_string(config.lastTest)));
+    EXPECT_NE(
+        std::string::npos,
+        ReadFileText(c_wszUdpConfigFile).find("\"LastTest\":" + std::to_string(config.lastTest)));
     EXPECT_EQ("received 10 echoed 10 end idle\n", relay.WaitForReport());
-    EXPECT_EQ(1u, testsupport::ResultFiles().size());
+    EXPECT_EQ(1u, ResultFiles().size());
 }
 
-TEST_F(UdpTestLaunch, ChamberFailuresStartNothing)
+TEST_F(UdpTestLaunch, FailuresBeforeTheStartStartNothing)
 {
-    for (const wchar_t *wszCall : {L"GetChamberSidFromId", L"CreateProcessInChamber"})
+    const std::string strLine = "2008|C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
+                                "127.0.0.1 -delay 1 -count 10 127.0.0.1 47216";
+    struct
     {
-        SCOPED_TRACE(testsupport::Narrow(wszCall));
-        ASSERT_EQ(S_OK, ChamberStandInSetFailure(wszCall, CHAMBER_STANDIN_FAILURE));
+        const wchar_t *wszFailingCall; // of the chamber stand-in
+        bool fLongRelay;               // a valid name, but the line passes 255 characters
+        HRESULT hr;
+        size_t cchLine; // of the command line's trace ("2008|" and the line, cut at 255)
+        const char *szFailure;
+    } rgCases[] = {
+        {L"GetChamberSidFromId", false, CHAMBER_STANDIN_FAILURE, strLine.size(),
+         "2001|GetChamberSidFromId|80070005"},
+        {L"CreateProcessInChamber", false, CHAMBER_STANDIN_FAILURE, strLine.size(),
+         "2001|CreateProcessInChamber|80070005"},
+        {nullptr, true, static_cast<HRESULT>(0x8007007A), 5 + 255, "2001|StringCchPrintf|8007007a"},
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(c.szFailure);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
+        if (c.wszFailingCall != nullptr)
+        {
+            ASSERT_EQ(S_OK, ChamberStandInSetFailure(c.wszFailingCall, CHAMBER_STANDIN_FAILURE));
+        }
         UdpTestConfig config = RelayConfig(47216);
-        TraceSession session;
+        config.relayFqdn = c.fLongRelay ? std::string(200, 'r') : config.relayFqdn;
+        CTraceSession session;
         HANDLE hProcess = nullptr;
-        EXPECT_EQ(CHAMBER_STANDIN_FAILURE, LaunchUdpTest(&config, &hProcess));
+        EXPECT_EQ(c.hr, LaunchUdpTest(&config, &hProcess));
         EXPECT_EQ(INVALID_HANDLE_VALUE, hProcess);
         EXPECT_EQ(0u, config.lastTest);
         std::vector<std::string> rgLines = session.Lines();
         ASSERT_EQ(2u, rgLines.size()); // the command line, the failure; nothing saved
-        EXPECT_EQ(0u, rgLines[0].rfind("2008|", 0));
-        EXPECT_EQ("2001|" + testsupport::Narrow(wszCall) + "|80070005", rgLines[1]);
+        EXPECT_EQ(0u, rgLines[0].rfind("2008|C:\\programs\\", 0));
+        EXPECT_EQ(c.cchLine, rgLines[0].size());
+        EXPECT_EQ(c.szFailure, rgLines[1]);
     }
     EXPECT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigFile));
 }
@@ -159,19 +183,4 @@ TEST_F(UdpTestLaunch, StartedTestIsHandedOutWhenTheSaveFails)
     EXPECT_TRUE(FAILED(hr));
     EXPECT_NE(0u, config.lastTest);
     WaitAndClose(hProcess); // tracked, so no second test could run beside it
-}
-
-TEST_F(UdpTestLaunch, CommandLineThatDoesNotFitIsRefused)
-{
-    UdpTestConfig config = RelayConfig(47218);
-    config.relayFqdn = std::string(200, 'r'); // a valid name, but the line passes 255
-    TraceSession session;
-    HANDLE hProcess = nullptr;
-    EXPECT_EQ(static_cast<HRESULT>(0x8007007A), LaunchUdpTest(&config, &hProcess));
-    EXPECT_EQ(INVALID_HANDLE_VALUE, hProcess);
-    std::vector<std::string> rgLines = session.Lines();
-    ASSERT_EQ(2u, rgLines.size());
-    EXPECT_EQ(2u + 255u, rgLines[0].size() - 3); // "2008|" and the cut line of 255
-    EXPECT_EQ("2001|StringCchPrintf|8007007a", rgLines[1]);
-    EXPECT_EQ(0u, config.lastTest);
 }

@@ -3,9 +3,12 @@
 #include "platform/endpointdirectory/endpointdirectory.h"
 #include "service/udptestpolicy.h"
 #include "tests/common/policyserver.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/tracesession.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
+
+using namespace testsupport;
 
 namespace
 {
@@ -97,14 +100,15 @@ std::string WithoutExpiration(const std::string &strText, uint64_t *pullExpirati
     return strText.substr(0, pos) + strText.substr(end);
 }
 
+// Runs on the test thread and owns the prefix's policy file and endpoint role while it runs.
 class UdpTestRefresh : public ::testing::Test
 {
 protected:
-    void SetUp() override { testsupport::PreparePolicyFolder(); }
+    void SetUp() override { PreparePolicyFolder(); }
     void TearDown() override
     {
         DeleteFileW(c_wszUdpConfigFile);
-        RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
+        HklmDeleteValue(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     }
 };
 } // namespace
@@ -119,13 +123,10 @@ static void RefreshAgainst(const RefreshCase &c)
     options.cChunks = c.cChunks;
     CTestPolicyServer server;
     ASSERT_TRUE(server.Start(options));
-    std::wstring wstrEndpoint = L"https://localhost:" + std::to_wstring(c.usPort) + L"/";
-    ASSERT_EQ(ERROR_SUCCESS,
-              RegSetKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                              REG_SZ, wstrEndpoint.c_str(),
-                              static_cast<DWORD>((wstrEndpoint.size() + 1) * sizeof(wchar_t))));
+    HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
+                  L"https://localhost:" + std::to_wstring(c.usPort) + L"/");
 
-    udptest::TraceSession session;
+    CTraceSession session;
     UdpTestConfig config;
     ResetUdpConfig(&config);
     uint64_t ullBefore = UdpConfigNow();
@@ -135,10 +136,8 @@ static void RefreshAgainst(const RefreshCase &c)
     uint64_t ullLifetime = c.outcome == Outcome::Applied ? c.ullLifetime : c_ullUdpConfigRetryTicks;
     EXPECT_LE(ullBefore + ullLifetime, config.expiration);
     EXPECT_GE(ullAfter + ullLifetime, config.expiration);
-    std::string strSaved;
-    ASSERT_TRUE(udptest::ReadWholeFile(c_wszUdpConfigFile, &strSaved));
     uint64_t ullSavedExpiration = 0;
-    EXPECT_EQ(c.szSaved, WithoutExpiration(strSaved, &ullSavedExpiration));
+    EXPECT_EQ(c.szSaved, WithoutExpiration(ReadFileText(c_wszUdpConfigFile), &ullSavedExpiration));
     EXPECT_EQ(config.expiration, ullSavedExpiration);
 
     std::vector<std::string> rgExpected = {"2005"};

@@ -2,7 +2,6 @@
 
 #include "service/udptestpolicy.h"
 #include "servicelib/eventtrace.h"
-#include "tests/common/testsupport.h"
 
 #include <gtest/gtest.h>
 #include <algorithm>
@@ -114,22 +113,6 @@ bool WriteWholeFile(const std::wstring &wstrPath, const std::string &strText)
     BOOL fOk = WriteFile(hFile, strText.data(), static_cast<DWORD>(strText.size()), &cb, nullptr);
     CloseHandle(hFile);
     return fOk && cb == strText.size();
-}
-
-} // namespace udptest
-
-namespace udptest
-{
-DWORD RunTelvanectl(const std::wstring &wstrArguments, std::string *pstrOutput)
-{
-    testsupport::ChildResult result = testsupport::RunChild(
-        L"\"" + testsupport::BinDir() + L"telvanectl.exe\" " + wstrArguments, {}, 30000);
-    EXPECT_FALSE(result.fTimedOut);
-    if (pstrOutput != nullptr)
-    {
-        *pstrOutput = result.strOutput;
-    }
-    return result.dwExitCode;
 }
 
 } // namespace udptest

@@ -27,11 +27,3 @@ bool ReadWholeFile(const std::wstring &wstrPath, std::string *pstrText);
 bool WriteWholeFile(const std::wstring &wstrPath, const std::string &strText);
 
 } // namespace udptest
-
-namespace udptest
-{
-// Runs telvanectl.exe with the arguments; returns its exit code (its output on failure goes
-// into the test's messages).
-DWORD RunTelvanectl(const std::wstring &wstrArguments, std::string *pstrOutput = nullptr);
-
-} // namespace udptest

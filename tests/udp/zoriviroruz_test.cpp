@@ -4,14 +4,14 @@
 #include "platform/securityruntime/securityruntime.h"
 #include "service/udptestcommandline.h"
 #include "tests/common/testsupport.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
 #include <algorithm>
 #include <memory>
 #include <sddl.h>
 
-using testsupport::CRelayProcess;
+using namespace testsupport;
 
 namespace
 {
@@ -54,7 +54,7 @@ HRESULT StartInChamber(const std::string &strArguments, PROCESS_INFORMATION *ppi
                        std::wstring *pwstrSid, std::wstring *pwstrCommandLine)
 {
     wchar_t wszCommandLine[256];
-    swprintf_s(wszCommandLine, L"%s %hs", testsupport::c_wszTestAppPath, strArguments.c_str());
+    swprintf_s(wszCommandLine, L"%s %hs", c_wszTestAppPath, strArguments.c_str());
     *pwstrCommandLine = wszCommandLine;
     PSID pSid = nullptr;
     HRESULT hr = GetChamberSidFromId(c_wszChamberId, &pSid);
@@ -101,9 +101,9 @@ void RunAndCollect(const std::string &strArguments, RunSummary *pSummary)
     EXPECT_EQ(wstrCommandLine, ReadChamberString(L"LastCommandLine"));
     EXPECT_EQ(pi.dwProcessId, ReadChamberDword(L"LastProcessId"));
 
-    std::vector<std::wstring> rgFiles = testsupport::ResultFiles();
+    std::vector<std::wstring> rgFiles = ResultFiles();
     ASSERT_EQ(1u, rgFiles.size());
-    ASSERT_TRUE(udptest::ReadWholeFile(rgFiles[0], &pSummary->strResult));
+    ASSERT_TRUE(ReadFileText(rgFiles[0], &pSummary->strResult));
     std::unique_ptr<JsonValue> pRoot(JsonReader::FromJsonString(pSummary->strResult.c_str()));
     ASSERT_EQ(JsonNodeType::Object, pRoot->Type());
     const JsonObjectNode *pObject = static_cast<const JsonObjectNode *>(pRoot.get());
@@ -113,61 +113,66 @@ void RunAndCollect(const std::string &strArguments, RunSummary *pSummary)
     pObject->GetMemberText("Error", pSummary->strError);
 }
 
+// Runs on the test thread and owns the installed test application, its results and the
+// chamber stand-in's key while it runs (the suite runs one test at a time).
 class ZoRiVirOruz : public ::testing::Test
 {
 protected:
     void SetUp() override
     {
-        testsupport::InstallTestApplication();
+        InstallTestApplication();
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
     void TearDown() override { RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY); }
 };
 } // namespace
 
-TEST_F(ZoRiVirOruz, CountsEchoesFromTheRelay)
+TEST_F(ZoRiVirOruz, CountsWhatTheRelayEchoes)
 {
-    // The relay leaves every fourth packet unanswered, so the count shows what came back.
-    CRelayProcess relay(47211, L"-drop 4");
-    ASSERT_TRUE(relay.Listening());
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    config.localIp = "127.0.0.1";
-    config.relayFqdn = "127.0.0.1";
-    config.relayPort = 47211;
-    config.numPackets = 20;
-    config.delay = 1;
-    std::string strArguments;
-    BuildTestCommandLine(config, strArguments);
-    ASSERT_EQ("-localIP 127.0.0.1 -delay 1 -count 20 127.0.0.1 47211", strArguments);
-
-    RunSummary summary;
-    RunAndCollect(strArguments, &summary);
-    EXPECT_EQ(0u, summary.dwExitCode) << summary.strResult;
-    EXPECT_EQ(20u, summary.ulSent) << summary.strResult;
-    EXPECT_EQ(15u, summary.ulReceived) << summary.strResult;
-    EXPECT_EQ(5u, summary.ulLost) << summary.strResult;
-    EXPECT_EQ("null", summary.strError); // no error: "" reads back as the text null
-    EXPECT_EQ("received 20 echoed 15 end idle\n", relay.WaitForReport());
-}
-
-TEST_F(ZoRiVirOruz, NobodyListeningLosesEverything)
-{
-    RunSummary summary;
-    RunAndCollect("-remoteIP -delay 1 -count 3 -size 64 127.0.0.1 47212", &summary);
-    EXPECT_EQ(0u, summary.dwExitCode) << summary.strResult;
-    EXPECT_EQ(3u, summary.ulSent) << summary.strResult;
-    EXPECT_EQ(0u, summary.ulReceived);
-    EXPECT_NE(std::string::npos, summary.strResult.find("\"PacketSize\":64"));
-}
-
-TEST_F(ZoRiVirOruz, UnresolvableRelayIsReportedInTheResult)
-{
-    RunSummary summary;
-    RunAndCollect("-remoteIP -count 3 relay.invalid 47213", &summary);
-    EXPECT_EQ(1u, summary.dwExitCode);
-    EXPECT_EQ(0u, summary.ulSent);
-    EXPECT_EQ(0u, summary.strError.rfind("cannot resolve the relay", 0)) << summary.strError;
+    struct
+    {
+        const char *szArguments;
+        USHORT usRelay;       // a relay listens on this port (0: none)
+        const char *szReport; // the relay's
+        DWORD dwExitCode;
+        uint32_t ulSent, ulReceived;
+        const char *szError;  // how "Error" starts ("null": none, "" read back as text null)
+        const char *szOption; // an option as the result records it
+    } rgCases[] = {
+        // The relay leaves every fourth packet unanswered, so the count shows what came back.
+        {"-localIP 127.0.0.1 -delay 1 -count 20 127.0.0.1 47211", 47211,
+         "received 20 echoed 15 end idle\n", 0, 20, 15, "null", "\"LocalIP\":\"127.0.0.1\""},
+        {"-remoteIP -delay 1 -count 3 -size 64 127.0.0.1 47212", 0, nullptr, 0, 3, 0, "null",
+         "\"PacketSize\":64"},
+        {"-remoteIP -count 3 relay.invalid 47213", 0, nullptr, 1, 0, 0, "cannot resolve the relay",
+         "\"Relay\":\"relay.invalid\""},
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(c.szArguments);
+        std::unique_ptr<CRelayProcess> pRelay;
+        if (c.usRelay != 0)
+        {
+            pRelay.reset(new CRelayProcess(c.usRelay, L"-drop 4"));
+            ASSERT_TRUE(pRelay->Listening());
+        }
+        for (const std::wstring &wstrFile : ResultFiles())
+        {
+            DeleteFileW(wstrFile.c_str());
+        }
+        RunSummary summary;
+        RunAndCollect(c.szArguments, &summary);
+        EXPECT_EQ(c.dwExitCode, summary.dwExitCode) << summary.strResult;
+        EXPECT_EQ(c.ulSent, summary.ulSent) << summary.strResult;
+        EXPECT_EQ(c.ulReceived, summary.ulReceived) << summary.strResult;
+        EXPECT_EQ(c.ulSent - c.ulReceived, summary.ulLost) << summary.strResult;
+        EXPECT_EQ(0u, summary.strError.rfind(c.szError, 0)) << summary.strError;
+        EXPECT_NE(std::string::npos, summary.strResult.find(c.szOption)) << summary.strResult;
+        if (pRelay != nullptr)
+        {
+            EXPECT_EQ(c.szReport, pRelay->WaitForReport());
+        }
+    }
 }
 
 TEST_F(ZoRiVirOruz, BadArguments)
@@ -187,12 +192,12 @@ TEST_F(ZoRiVirOruz, BadArguments)
     };
     for (const wchar_t *wszArguments : rgwszArguments)
     {
-        SCOPED_TRACE(testsupport::Narrow(wszArguments));
-        testsupport::ChildResult result = testsupport::RunChild(
-            std::wstring(testsupport::c_wszTestAppPath) + L" " + wszArguments, {}, 30000);
+        SCOPED_TRACE(Narrow(wszArguments));
+        ChildResult result =
+            RunChild(std::wstring(c_wszTestAppPath) + L" " + wszArguments, {}, 30000);
         EXPECT_EQ(2u, result.dwExitCode) << result.strOutput;
     }
-    EXPECT_TRUE(testsupport::ResultFiles().empty()); // a refused command line measures nothing
+    EXPECT_TRUE(ResultFiles().empty()); // a refused command line measures nothing
 }
 
 TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
@@ -201,18 +206,16 @@ TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
     for (int i = 0; i < 70; i++)
     {
         wchar_t wszName[MAX_PATH];
-        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json",
-                   testsupport::c_wszResultFolder, i);
-        ASSERT_TRUE(udptest::WriteWholeFile(wszName, "{}"));
+        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json", c_wszResultFolder, i);
+        ASSERT_TRUE(WriteFileText(wszName, "{}"));
     }
-    testsupport::ChildResult result = testsupport::RunChild(
-        std::wstring(testsupport::c_wszTestAppPath) + L" -count 0 127.0.0.1 47214", {}, 60000);
+    ChildResult result =
+        RunChild(std::wstring(c_wszTestAppPath) + L" -count 0 127.0.0.1 47214", {}, 60000);
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
-    std::vector<std::wstring> rgFiles = testsupport::ResultFiles();
+    std::vector<std::wstring> rgFiles = ResultFiles();
     EXPECT_EQ(64u, rgFiles.size());
     std::sort(rgFiles.begin(), rgFiles.end());
-    EXPECT_EQ(std::wstring(testsupport::c_wszResultFolder) +
-                  L"\\result-20200101T000007.000Z-1.json",
+    EXPECT_EQ(std::wstring(c_wszResultFolder) + L"\\result-20200101T000007.000Z-1.json",
               rgFiles.front());
     EXPECT_EQ(std::wstring::npos, rgFiles.back().find(L"result-2020")); // the new run
 }
