@@ -364,29 +364,21 @@ TEST_F(TraceDocumentTest, PhoneDescribesTheDeviceAsTheLibraryAnswers)
         Members rgChanged; // "*" stands for every member, "Build" for the build record's
     };
     const Row rgRows[] = {
+        // clang-format off
         {"defaults", {}, {}, {}},
         {"every call fails", {L"*"}, {}, {{"*", "-"}}},
         {"build record fails", {L"Build"}, {}, {{"Build", "-"}}},
-        {"two items fail",
-         {L"Manufacturer", L"PhoneSOCVersion"},
-         {},
+        {"two items fail", {L"Manufacturer", L"PhoneSOCVersion"}, {},
          {{"Manufacturer", "-"}, {"PhoneSOCVersion", "-"}}},
-        {"300-character friendly name",
-         {},
-         {{L"PhoneFriendlyName", std::wstring(300, L'x')}},
+        {"300-character friendly name", {}, {{L"PhoneFriendlyName", std::wstring(300, L'x')}},
          {{"PhoneFriendlyName", "\"error\""}}},
-        {"friendly name outside ASCII",
-         {},
-         {{L"PhoneFriendlyName", L"Lumen \x00e9\x00e8"}},
+        {"friendly name outside ASCII", {}, {{L"PhoneFriendlyName", L"Lumen \x00e9\x00e8"}},
          {{"PhoneFriendlyName", "\"Lumen \xC3\xA9\xC3\xA8\""}}},
-        {"item longer than the buffer",
-         {},
-         {{L"PhoneModelName", std::wstring(1024, L'y')}},
+        {"item longer than the buffer", {}, {{L"PhoneModelName", std::wstring(1024, L'y')}},
          {{"PhoneModelName", "-"}}},
-        {"build values set",
-         {},
-         {{L"Branch", L"rs_prerelease"}, {L"BuildNumber", L"4294967295"}},
+        {"build values set", {}, {{L"Branch", L"rs_prerelease"}, {L"BuildNumber", L"4294967295"}},
          {{"Branch", "\"rs_prerelease\""}, {"BuildNumber", "4294967295"}}},
+        // clang-format on
     };
     for (const Row &row : rgRows)
     {

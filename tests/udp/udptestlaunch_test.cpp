@@ -8,7 +8,6 @@
 #include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
-#include <functional>
 
 using namespace testsupport;
 
@@ -57,49 +56,41 @@ protected:
 
 TEST_F(UdpTestLaunch, WiFiGate)
 {
-    const char *const c_szRefused = "2001|We dont have active WiFi|0";
+    const std::string strRefused = "2001|We dont have active WiFi|0";
     struct
     {
-        const char *szName;
-        std::function<HRESULT()> set;
-        bool fActive;
-        const char *szAddress;
+        const wchar_t *wszConnected; // the adapter's address; null: disconnected
+        const wchar_t *wszFailing;   // the stand-in's call that fails, if any
+        HRESULT hrFailure;
+        const char *szAddress; // what the gate fills in; empty: the gate refuses
         std::vector<std::string> rgstrTrace;
     } rgCases[] = {
-        {"connected", [] { return WiFiStandInSetConnected(L"10.1.2.3"); }, true, "10.1.2.3", {}},
-        {"a 16-character address",
-         [] { return WiFiStandInSetConnected(L"fe80::1234:5678a"); },
-         true,
-         "fe80::1234:5678a",
-         {}},
-        {"disconnected", [] { return WiFiStandInSetDisconnected(); }, false, "", {c_szRefused}},
-        {"OpenHandle fails",
-         [] { return WiFiStandInSetFailure(L"OpenHandle", c_hrWiFiStandInFailure); },
-         false,
-         "",
-         {"2001|WiFiUserHandle::OpenHandle|80070015", c_szRefused}},
-        {"QueryConnectionState fails",
-         [] { return WiFiStandInSetFailure(L"QueryConnectionState", E_FAIL); },
-         false,
-         "",
-         {"2001|QueryConnectionState|80004005", c_szRefused}},
-        {"QueryAdapterInfo fails",
-         [] {
-             WiFiStandInSetConnected(L"10.1.2.3");
-             return WiFiStandInSetFailure(L"QueryAdapterInfo", c_hrWiFiStandInFailure);
-         },
-         false,
-         "",
-         {"2001|QueryAdapterInfo|80070015", c_szRefused}},
+        // clang-format off
+        {L"10.1.2.3", nullptr, S_OK, "10.1.2.3", {}},
+        {L"fe80::1234:5678a", nullptr, S_OK, "fe80::1234:5678a", {}}, // 16 characters, no zero
+        {nullptr, nullptr, S_OK, "", {strRefused}},
+        {L"10.1.2.3", L"OpenHandle", c_hrWiFiStandInFailure, "",
+         {"2001|WiFiUserHandle::OpenHandle|80070015", strRefused}},
+        {L"10.1.2.3", L"QueryConnectionState", E_FAIL, "",
+         {"2001|QueryConnectionState|80004005", strRefused}},
+        {L"10.1.2.3", L"QueryAdapterInfo", c_hrWiFiStandInFailure, "",
+         {"2001|QueryAdapterInfo|80070015", strRefused}},
+        // clang-format on
     };
     for (const auto &c : rgCases)
     {
-        SCOPED_TRACE(c.szName);
-        ASSERT_EQ(S_OK, c.set());
+        SCOPED_TRACE(c.wszFailing != nullptr ? Narrow(c.wszFailing) : c.szAddress);
+        HklmDeleteKey(WIFI_STANDIN_KEY);
+        ASSERT_EQ(S_OK, c.wszConnected != nullptr ? WiFiStandInSetConnected(c.wszConnected)
+                                                  : WiFiStandInSetDisconnected());
+        if (c.wszFailing != nullptr)
+        {
+            ASSERT_EQ(S_OK, WiFiStandInSetFailure(c.wszFailing, c.hrFailure));
+        }
         CTraceSession session;
         UdpTestConfig config;
         ResetUdpConfig(&config);
-        EXPECT_EQ(c.fActive, UdpTestWiFiActive(&config));
+        EXPECT_EQ(*c.szAddress != '\0', UdpTestWiFiActive(&config));
         EXPECT_EQ(c.szAddress, config.localIp);
         EXPECT_EQ(c.rgstrTrace, session.Lines());
         EXPECT_EQ(0, WiFiStandInLiveHandles());
@@ -117,11 +108,23 @@ TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
     HANDLE hProcess = INVALID_HANDLE_VALUE;
     EXPECT_EQ(S_OK, LaunchUdpTest(&config, &hProcess));
     uint64_t ullAfter = UdpConfigNow();
+    DWORD dwProcessId = GetProcessId(hProcess);
     WaitAndClose(hProcess);
 
     const std::string strCommandLine = "C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
                                        "127.0.0.1 -delay 1 -count 10 127.0.0.1 47215";
     EXPECT_EQ(std::vector<std::string>({"2008|" + strCommandLine, "2007"}), session.Lines());
+    // The chamber stand-in records what it started, and in which chamber.
+    std::wstring wstrSid, wstrInstance, wstrCommandLine;
+    DWORD dwType = 0, dwRecordedId = 0;
+    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberSid", &dwType, &wstrSid));
+    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberInstance", &dwType, &wstrInstance));
+    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastCommandLine", &dwType, &wstrCommandLine));
+    ASSERT_TRUE(HklmReadDword(CHAMBER_STANDIN_KEY, L"LastProcessId", &dwRecordedId));
+    EXPECT_EQ(0u, wstrSid.rfind(L"S-1-15-2-", 0));
+    EXPECT_STREQ(c_wszUdpTestChamberInstance, wstrInstance.c_str());
+    EXPECT_EQ(strCommandLine, Narrow(wstrCommandLine.c_str()));
+    EXPECT_EQ(dwProcessId, dwRecordedId);
     EXPECT_LE(ullBefore, config.lastTest);
     EXPECT_GE(ullAfter, config.lastTest);
     EXPECT_NE(

@@ -12,80 +12,48 @@ using namespace testsupport;
 
 namespace
 {
-enum class Outcome
-{
-    Applied,     // expiration from the answer
-    RetryInWeek, // a failed refresh
-};
-
 struct RefreshCase
 {
     const char *szName;
-    USHORT usPort; // one each: a later request may reuse an earlier connection
     int iStatus;
     unsigned cChunks; // 0: one body with its length
     const char *szBody;
-    Outcome outcome;
-    uint64_t ullLifetime;                   // Applied: now plus this
+    uint64_t ullLifetime;                   // expires now plus this; 0: a failed refresh
     std::vector<std::string> rgstrFailures; // the 2001 lines between 2005 and 2007
     const char *szSaved;                    // the saved text, "Expiration" left out
 };
 
 const uint64_t c_ullDay = 864000000000ull;
 
+// clang-format off
 const RefreshCase c_rgRefreshCases[] = {
-    {"a policy with a lifetime",
-     47220,
-     200,
-     0,
+    {"a policy with a lifetime", 200, 0,
      R"({"Enabled":"true","RelayFQDN":"127.0.0.1","RelayPort":47250,"NumPackets":100,)"
      R"("MaxTestDay":2,"DurationValid":"P1D","Policy":"BattAC"})",
-     Outcome::Applied,
-     c_ullDay,
-     {},
+     c_ullDay, {},
      R"({"Enabled":true,"RelayFQDN":"127.0.0.1","RelayPort":47250,"LastTest":0,)"
      R"("NumPackets":100,"MaxTestDay":2,"Policy":"BattAC"})"},
-    {"chunked, mains power only",
-     47221,
-     200,
-     3,
+    {"chunked, mains power only", 200, 3,
      R"({"Enabled":true,"RelayFQDN":"relay.example.net","RelayPort":7,"DurationValid":"PT30M"})",
-     Outcome::Applied,
-     18000000000ull,
-     {},
+     18000000000ull, {},
      R"({"Enabled":true,"RelayFQDN":"relay.example.net","RelayPort":7,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"ACOnly"})"},
-    {"an answer without expiration",
-     47222,
-     200,
-     0,
+    {"an answer without expiration", 200, 0,
      R"({"Enabled":true,"RelayFQDN":"r","RelayPort":9,"Policy":"ACOnly"})",
-     Outcome::RetryInWeek,
-     0,
-     {"2001|ParseJson|80070057"},
+     0, {"2001|ParseJson|80070057"},
      R"({"Enabled":true,"RelayFQDN":"r","RelayPort":9,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})"},
-    {"a relay name for a shell",
-     47223,
-     200,
-     0,
+    {"a relay name for a shell", 200, 0,
      R"({"Enabled":true,"RelayFQDN":"r & calc.exe","RelayPort":9,"DurationValid":"P1D"})",
-     Outcome::RetryInWeek,
-     0,
-     {"2001|RelayFQDN|80070057", "2001|ParseJson|80070057"},
+     0, {"2001|RelayFQDN|80070057", "2001|ParseJson|80070057"},
      R"({"Enabled":true,"RelayFQDN":"","RelayPort":0,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})"},
-    {"not found",
-     47224,
-     404,
-     0,
-     "",
-     Outcome::RetryInWeek,
-     0,
-     {"2001|OrvexJsonSendRequest|80070490"},
+    {"not found", 404, 0, "",
+     0, {"2001|OrvexJsonSendRequest|80070490"},
      R"({"Enabled":false,"RelayFQDN":"","RelayPort":0,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})"},
 };
+// clang-format on
 
 // The saved text without its "Expiration" member, which depends on the clock.
 std::string WithoutExpiration(const std::string &strText, uint64_t *pullExpiration)
@@ -111,12 +79,11 @@ protected:
         HklmDeleteValue(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     }
 };
-} // namespace
 
-static void RefreshAgainst(const RefreshCase &c)
+void RefreshAgainst(const RefreshCase &c, USHORT usPort)
 {
     PolicyServerOptions options;
-    options.usPort = c.usPort;
+    options.usPort = usPort;
     options.iStatus = c.iStatus;
     options.strBody = c.szBody;
     options.fUseBody = true;
@@ -124,7 +91,7 @@ static void RefreshAgainst(const RefreshCase &c)
     CTestPolicyServer server;
     ASSERT_TRUE(server.Start(options));
     HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                  L"https://localhost:" + std::to_wstring(c.usPort) + L"/");
+                  L"https://localhost:" + std::to_wstring(usPort) + L"/");
 
     CTraceSession session;
     UdpTestConfig config;
@@ -133,7 +100,7 @@ static void RefreshAgainst(const RefreshCase &c)
     RefreshUdpConfig(&config);
     uint64_t ullAfter = UdpConfigNow();
 
-    uint64_t ullLifetime = c.outcome == Outcome::Applied ? c.ullLifetime : c_ullUdpConfigRetryTicks;
+    uint64_t ullLifetime = c.ullLifetime != 0 ? c.ullLifetime : c_ullUdpConfigRetryTicks;
     EXPECT_LE(ullBefore + ullLifetime, config.expiration);
     EXPECT_GE(ullAfter + ullLifetime, config.expiration);
     uint64_t ullSavedExpiration = 0;
@@ -150,13 +117,16 @@ static void RefreshAgainst(const RefreshCase &c)
     ASSERT_EQ(1u, rgRequests.size());
     EXPECT_NE(std::string::npos, rgRequests[0].find("/v1/api/config/udpecho")) << rgRequests[0];
 }
+} // namespace
 
 TEST_F(UdpTestRefresh, AppliesAndSavesTheAnswer)
 {
+    // A port each: a later request may reuse an earlier connection.
+    USHORT usPort = 47220;
     for (const RefreshCase &c : c_rgRefreshCases)
     {
         SCOPED_TRACE(c.szName);
-        RefreshAgainst(c);
+        RefreshAgainst(c, usPort++);
         DeleteFileW(c_wszUdpConfigFile);
     }
 }
