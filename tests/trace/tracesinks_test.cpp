@@ -155,7 +155,10 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
     }
 }
 
-TEST_F(TraceSinksTest, WithoutTheTestFolderNoFileIsWrittenAndTheSubmissionStillHappens)
+// A failing file sink stops only the file: without C:\Data\Test (only the last folder is
+// made: a device without it is not a test device), or with a file named like the folder (used
+// unchanged, and every open under it fails).
+TEST_F(TraceSinksTest, AFailingFileSinkStopsOnlyTheFile)
 {
     RemoveTree(L"C:\\Data\\Test");
     HklmSetDword(c_wszPreferenceKey, c_wszPreferenceValue, 3);
@@ -166,28 +169,20 @@ TEST_F(TraceSinksTest, WithoutTheTestFolderNoFileIsWrittenAndTheSubmissionStillH
     EXPECT_EQ(1u, session.CountLines(c_strWritingFile));
     EXPECT_EQ(1u, SubmissionList().size());
 
-    // Only the last folder is made: with its parent back, the folder appears.
     CreateFolders(L"C:\\Data\\Test");
-    FlushOneLog();
-    EXPECT_EQ(1u, FileNames(c_wszTraceFolder).size());
-    EXPECT_EQ(2u, SubmissionList().size());
-}
-
-TEST_F(TraceSinksTest, AFolderInTheWayOrAFileNamedLikeTheFolderStopsOnlyTheFile)
-{
-    // "WiFiLog" exists as a file: it is used unchanged and every open under it fails.
-    CFileHandle file(CreateFileW(TraceSinks::c_wszTraceDirectory, GENERIC_WRITE, 0, nullptr,
-                                 CREATE_ALWAYS, FILE_ATTRIBUTE_NORMAL, nullptr));
-    ASSERT_TRUE(file.IsValid());
-    file.Close();
+    ASSERT_TRUE(WriteFileText(c_wszTraceFolder, ""));
     std::wstring wstrPath;
     EXPECT_EQ(S_OK, TraceSinks::MakeTraceFileName(wstrPath));
-    EXPECT_EQ(0u, wstrPath.find(std::wstring(TraceSinks::c_wszTraceDirectory) + L"\\"));
+    EXPECT_EQ(0u, wstrPath.find(std::wstring(c_wszTraceFolder) + L"\\"));
     EXPECT_TRUE(FAILED(TraceSinks::WriteTraceToFile("{}", 2)));
-    AllowDelivery(2);
     FlushOneLog();
-    EXPECT_EQ(1u, SubmissionList().size());
-    DeleteFileW(TraceSinks::c_wszTraceDirectory);
+    EXPECT_EQ(2u, SubmissionList().size());
+    DeleteFileW(c_wszTraceFolder);
+
+    // With its parent there, the folder appears.
+    FlushOneLog();
+    EXPECT_EQ(1u, FileNames(c_wszTraceFolder).size());
+    EXPECT_EQ(3u, SubmissionList().size());
 }
 
 // Operations flush on their own threads: when the folder is missing, several of them may
@@ -223,19 +218,65 @@ TEST_F(TraceSinksTest, FlushesRacingToCreateTheFolderAllGetAName)
     EXPECT_EQ(0, cFailed) << "of " << c_cRounds * c_cThreads;
 }
 
-TEST_F(TraceSinksTest, TheSubmissionCarriesTheProfileInTheLibrarysCallOrder)
+// The library's calls in its order whatever fails, the submitter and the profile destroyed on
+// every path; a failure is traced with the code that failed.
+TEST_F(TraceSinksTest, TheSubmissionFollowsTheLibrarysCallOrder)
 {
-    AllowDelivery(2);
-    FlushOneLog();
-    std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
-    ASSERT_EQ(1u, rgSubmissions.size());
-    const SUBMISSION_RECORD &submission = rgSubmissions[0];
-    EXPECT_EQ("ZARI_DavoDuvuri_Z1", submission.strProfileName);
-    EXPECT_EQ("null 0 null", submission.strTarget);
-    EXPECT_EQ("null", submission.strGuid);
+    struct Row
+    {
+        DWORD dwInit;
+        DWORD dwSubmit;
+        std::vector<std::string> rgCalls; // between the constructors and the destructors
+        const char *szFailure;
+    };
+    // "%" stands for the text's length.
+    const Row rgRows[] = {
+        {0x1234, 0, {"Init() = 0x1234"}, "1002|Vantor Init()|1234"},
+        {0,
+         ERROR_NOT_ENOUGH_MEMORY,
+         {"Init() = 0x0", "SubmitData(% bytes, null) = 0x8"},
+         "1002|Vantor SubmitData()|8"},
+        {0x5, 0x6, {"Init() = 0x5"}, "1002|Vantor Init()|5"},
+        {0, 0, {"Init() = 0x0", "SubmitData(% bytes, null) = 0x0"}, nullptr},
+    };
+    for (const Row &row : rgRows)
+    {
+        SCOPED_TRACE(row.rgCalls.back());
+        ResetDeliveryState();
+        AllowDelivery(2);
+        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionInitResult, row.dwInit));
+        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionSubmitResult, row.dwSubmit));
+        CTraceSession session;
+        FlushOneLog();
+        std::vector<DeliveredLog> rgFiles = DeliveredLogs();
+        ASSERT_EQ(1u, rgFiles.size());
+        std::vector<std::string> rgExpected = {
+            "CrowdsourcingProfile_t()", "CrowdsourcingDataSubmitter_t(profile, null 0 null)"};
+        for (std::string strCall : row.rgCalls)
+        {
+            size_t pos = strCall.find('%');
+            rgExpected.push_back(
+                pos == std::string::npos
+                    ? strCall
+                    : strCall.replace(pos, 1, std::to_string(rgFiles[0].strText.size())));
+        }
+        rgExpected.push_back("~CrowdsourcingDataSubmitter_t()");
+        rgExpected.push_back("~CrowdsourcingProfile_t()");
+        EXPECT_EQ(rgExpected, JournalCalls());
+        bool fFails = row.szFailure != nullptr;
+        EXPECT_EQ(fFails ? 1u : 0u, session.CountLines(fFails ? row.szFailure : ""));
+        EXPECT_EQ(fFails ? 1u : 0u,
+                  session.Count("Vantor Init()") + session.Count("Vantor SubmitData()"));
+        EXPECT_EQ(fFails ? 0u : 1u, SubmissionList().size());
+    }
 
     // The 120 bytes as the library received them: the name with zeros to 64 bytes, the
     // eight settings, and the library's 24 bytes as its constructor left them.
+    std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
+    ASSERT_EQ(1u, rgSubmissions.size());
+    EXPECT_EQ("ZARI_DavoDuvuri_Z1", rgSubmissions[0].strProfileName);
+    EXPECT_EQ("null 0 null", rgSubmissions[0].strTarget);
+    EXPECT_EQ("null", rgSubmissions[0].strGuid);
     const DWORD rgdwSettings[8] = {0xFFFFFFFF, 1, 1, 0, 1, 1, 4096, 500};
     std::vector<BYTE> rgbExpected(120, 0);
     const char szName[] = "ZARI_DavoDuvuri_Z1";
@@ -245,59 +286,7 @@ TEST_F(TraceSinksTest, TheSubmissionCarriesTheProfileInTheLibrarysCallOrder)
     }
     memcpy(&rgbExpected[64], rgdwSettings, sizeof(rgdwSettings));
     memcpy(&rgbExpected[96], "CSPROF\1", 8);
-    EXPECT_EQ(rgbExpected, submission.rgbProfile);
-
-    std::string strLength = std::to_string(submission.strData.size());
-    EXPECT_EQ((std::vector<std::string>{
-                  "CrowdsourcingProfile_t()",
-                  "CrowdsourcingDataSubmitter_t(profile, null 0 null)",
-                  "Init() = 0x0",
-                  "SubmitData(" + strLength + " bytes, null) = 0x0",
-                  "~CrowdsourcingDataSubmitter_t()",
-                  "~CrowdsourcingProfile_t()",
-              }),
-              JournalCalls());
-}
-
-TEST_F(TraceSinksTest, FailuresOfTheLibraryAreTracedWithItsCode)
-{
-    struct Row
-    {
-        const char *szCase;
-        DWORD dwInit;
-        DWORD dwSubmit;
-        const char *szFailure; // the one failure traced, with the code that failed
-        size_t cSubmitCalls;
-    };
-    const Row rgRows[] = {
-        {"Init fails", 0x1234, 0, "1002|Vantor Init()|1234", 0},
-        {"SubmitData fails", 0, ERROR_NOT_ENOUGH_MEMORY, "1002|Vantor SubmitData()|8", 1},
-        {"both would fail", 0x5, 0x6, "1002|Vantor Init()|5", 0},
-    };
-    for (const Row &row : rgRows)
-    {
-        SCOPED_TRACE(row.szCase);
-        ResetDeliveryState();
-        HklmSetDword(c_wszPreferenceKey, c_wszPreferenceValue, 3);
-        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionInitResult, row.dwInit));
-        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionSubmitResult, row.dwSubmit));
-        CTraceSession session;
-        FlushOneLog();
-        EXPECT_EQ(1u, session.CountLines(row.szFailure));
-        EXPECT_EQ(1u, session.Count("Vantor Init()") + session.Count("Vantor SubmitData()"));
-        EXPECT_TRUE(SubmissionList().empty());
-        std::vector<std::string> rgCalls = JournalCalls();
-        size_t cSubmitCalls = 0;
-        for (const std::string &strCall : rgCalls)
-        {
-            cSubmitCalls += strCall.rfind("SubmitData(", 0) == 0 ? 1 : 0;
-        }
-        EXPECT_EQ(row.cSubmitCalls, cSubmitCalls);
-        // The submitter and the profile are destroyed on every path, in that order.
-        ASSERT_GE(rgCalls.size(), 2u);
-        EXPECT_EQ("~CrowdsourcingDataSubmitter_t()", rgCalls[rgCalls.size() - 2]);
-        EXPECT_EQ("~CrowdsourcingProfile_t()", rgCalls.back());
-    }
+    EXPECT_EQ(rgbExpected, rgSubmissions[0].rgbProfile);
 }
 
 namespace

@@ -1,5 +1,6 @@
 // The Wi-Fi and chamber stand-ins, set through telvanectl in a child process (as tests of
-// the running service and the demo set them) and read back through the library calls.
+// the running service and the demo set them) and read back through the library calls. (What
+// the Wi-Fi stand-in answers is UdpTestLaunch.WiFiGate's.)
 #include "platform/securityruntime/securityruntime.h"
 #include "platform/wifi/wifiuser.h"
 #include "tests/common/testsupport.h"
@@ -11,46 +12,6 @@ using namespace testsupport;
 
 namespace
 {
-struct WiFiAnswers
-{
-    HRESULT hrOpen = S_OK;
-    HRESULT hrState = S_OK;
-    WiFiConnectionState state = WiFiConnectionStateUnknown;
-    bool fNetwork = false;
-    HRESULT hrAdapter = S_OK;
-    std::wstring wstrAddress; // the first 16 characters of the block, up to a zero
-};
-
-WiFiAnswers AskWiFi()
-{
-    WiFiAnswers answers;
-    WiFiUserHandle *pHandle = nullptr;
-    answers.hrOpen = WiFiUserHandle::OpenHandle(c_dwWiFiUserVersion, &pHandle);
-    if (FAILED(answers.hrOpen))
-    {
-        EXPECT_EQ(nullptr, pHandle);
-        return answers;
-    }
-    WiFiNetwork *pNetwork = nullptr;
-    answers.hrState = pHandle->QueryConnectionState(&answers.state, &pNetwork);
-    answers.fNetwork = pNetwork != nullptr;
-    if (pNetwork != nullptr)
-    {
-        EXPECT_STREQ(L"TelvaneTestNet", pNetwork->Ssid());
-        delete pNetwork;
-    }
-    WiFiAdapterInfo info;
-    memset(&info, 0xCC, sizeof(info));
-    answers.hrAdapter = pHandle->QueryAdapterInfo(&info);
-    if (SUCCEEDED(answers.hrAdapter))
-    {
-        answers.wstrAddress.assign(info.wszAddress, wcsnlen(info.wszAddress, 16));
-        EXPECT_EQ(0, info.rgbReserved[0]); // the rest of the block is zeroed
-    }
-    WiFiUserHandle::CloseHandle(pHandle);
-    return answers;
-}
-
 // Runs on the test thread and owns the stand-ins' keys while it runs (the suite runs one test
 // at a time).
 class StandIns : public ::testing::Test
@@ -63,59 +24,6 @@ protected:
     }
 };
 } // namespace
-
-TEST_F(StandIns, WiFiAnswersWhatTelvanectlSet)
-{
-    const HRESULT hrDefault = c_hrWiFiStandInFailure;
-    struct
-    {
-        const wchar_t *wszCommand; // null: no state at all
-        HRESULT hrOpen, hrState;
-        WiFiConnectionState state;
-        bool fNetwork;
-        HRESULT hrAdapter;
-        const wchar_t *wszAddress;
-    } rgCases[] = {
-        {nullptr, S_OK, S_OK, WiFiConnectionStateDisconnected, false, S_OK, L""},
-        {L"connected 10.1.2.3", S_OK, S_OK, WiFiConnectionStateConnected, true, S_OK, L"10.1.2.3"},
-        {L"connected fe80::1234:5678a", S_OK, S_OK, WiFiConnectionStateConnected, true, S_OK,
-         L"fe80::1234:5678a"}, // 16 characters fill the field, unterminated
-        {L"fail QueryAdapterInfo", S_OK, S_OK, WiFiConnectionStateConnected, true, hrDefault, L""},
-        {L"fail QueryConnectionState 80004005", S_OK, E_FAIL, WiFiConnectionStateUnknown, false,
-         S_OK, L"fe80::1234:5678a"},
-        {L"fail OpenHandle", hrDefault, S_OK, WiFiConnectionStateUnknown, false, S_OK, L""},
-        {L"disconnected", S_OK, S_OK, WiFiConnectionStateDisconnected, false, S_OK, L""},
-    };
-    for (const auto &c : rgCases)
-    {
-        SCOPED_TRACE(Narrow(c.wszCommand != nullptr ? c.wszCommand : L"no state"));
-        if (c.wszCommand == nullptr)
-        {
-            HklmDeleteKey(WIFI_STANDIN_KEY);
-        }
-        else
-        {
-            ChildResult result = RunTelvanectl(std::wstring(L"platform wifi ") + c.wszCommand);
-            ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-        }
-        WiFiAnswers answers = AskWiFi();
-        EXPECT_EQ(c.hrOpen, answers.hrOpen);
-        if (FAILED(c.hrOpen))
-        {
-            continue;
-        }
-        EXPECT_EQ(c.hrState, answers.hrState);
-        EXPECT_EQ(c.state, answers.state);
-        EXPECT_EQ(c.fNetwork, answers.fNetwork);
-        EXPECT_EQ(c.hrAdapter, answers.hrAdapter);
-        EXPECT_EQ(c.wszAddress, answers.wstrAddress);
-    }
-    EXPECT_EQ(0, WiFiStandInLiveHandles());
-    EXPECT_EQ(0, WiFiStandInLiveNetworks());
-    WiFiUserHandle *pHandle = nullptr;
-    EXPECT_EQ(E_INVALIDARG, WiFiUserHandle::OpenHandle(2, &pHandle)); // another version
-    EXPECT_EQ(nullptr, pHandle);
-}
 
 TEST_F(StandIns, TelvanectlRefusesBadWiFiCommands)
 {

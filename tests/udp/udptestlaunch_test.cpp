@@ -54,38 +54,35 @@ protected:
 };
 } // namespace
 
+// The gate against the Wi-Fi stand-in as telvanectl sets it (as the demo does), one row after
+// the other: a failure replaces the one before, "disconnected" clears it.
 TEST_F(UdpTestLaunch, WiFiGate)
 {
     const std::string strRefused = "2001|We dont have active WiFi|0";
     struct
     {
-        const wchar_t *wszConnected; // the adapter's address; null: disconnected
-        const wchar_t *wszFailing;   // the stand-in's call that fails, if any
-        HRESULT hrFailure;
-        const char *szAddress; // what the gate fills in; empty: the gate refuses
+        const wchar_t *wszCommand; // "platform wifi ..."; null: no state at all
+        const char *szAddress;     // what the gate fills in; empty: the gate refuses
         std::vector<std::string> rgstrTrace;
     } rgCases[] = {
-        // clang-format off
-        {L"10.1.2.3", nullptr, S_OK, "10.1.2.3", {}},
-        {L"fe80::1234:5678a", nullptr, S_OK, "fe80::1234:5678a", {}}, // 16 characters, no zero
-        {nullptr, nullptr, S_OK, "", {strRefused}},
-        {L"10.1.2.3", L"OpenHandle", c_hrWiFiStandInFailure, "",
-         {"2001|WiFiUserHandle::OpenHandle|80070015", strRefused}},
-        {L"10.1.2.3", L"QueryConnectionState", E_FAIL, "",
+        {nullptr, "", {strRefused}},
+        {L"connected 10.1.2.3", "10.1.2.3", {}},
+        {L"connected fe80::1234:5678a", "fe80::1234:5678a", {}}, // 16 characters, no zero
+        {L"fail QueryAdapterInfo", "", {"2001|QueryAdapterInfo|80070015", strRefused}},
+        {L"fail QueryConnectionState 80004005",
+         "",
          {"2001|QueryConnectionState|80004005", strRefused}},
-        {L"10.1.2.3", L"QueryAdapterInfo", c_hrWiFiStandInFailure, "",
-         {"2001|QueryAdapterInfo|80070015", strRefused}},
-        // clang-format on
+        {L"fail OpenHandle", "", {"2001|WiFiUserHandle::OpenHandle|80070015", strRefused}},
+        {L"disconnected", "", {strRefused}},
     };
+    HklmDeleteKey(WIFI_STANDIN_KEY);
     for (const auto &c : rgCases)
     {
-        SCOPED_TRACE(c.wszFailing != nullptr ? Narrow(c.wszFailing) : c.szAddress);
-        HklmDeleteKey(WIFI_STANDIN_KEY);
-        ASSERT_EQ(S_OK, c.wszConnected != nullptr ? WiFiStandInSetConnected(c.wszConnected)
-                                                  : WiFiStandInSetDisconnected());
-        if (c.wszFailing != nullptr)
+        SCOPED_TRACE(Narrow(c.wszCommand != nullptr ? c.wszCommand : L"no state"));
+        if (c.wszCommand != nullptr)
         {
-            ASSERT_EQ(S_OK, WiFiStandInSetFailure(c.wszFailing, c.hrFailure));
+            ChildResult result = RunTelvanectl(std::wstring(L"platform wifi ") + c.wszCommand);
+            ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
         }
         CTraceSession session;
         UdpTestConfig config;
@@ -96,6 +93,9 @@ TEST_F(UdpTestLaunch, WiFiGate)
         EXPECT_EQ(0, WiFiStandInLiveHandles());
         EXPECT_EQ(0, WiFiStandInLiveNetworks());
     }
+    WiFiUserHandle *pHandle = nullptr;
+    EXPECT_EQ(E_INVALIDARG, WiFiUserHandle::OpenHandle(2, &pHandle)); // another version
+    EXPECT_EQ(nullptr, pHandle);
 }
 
 TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
