@@ -25,6 +25,21 @@ protected:
 };
 } // namespace
 
+// The adapter block comes back whole, whatever the caller's buffer held: the address
+// terminated, the rest zeroed.
+TEST_F(StandIns, WiFiFillsTheWholeAdapterBlock)
+{
+    ASSERT_EQ(S_OK, WiFiStandInSetConnected(L"10.1.2.3"));
+    WiFiUserHandle *pHandle = nullptr;
+    ASSERT_EQ(S_OK, WiFiUserHandle::OpenHandle(c_dwWiFiUserVersion, &pHandle));
+    WiFiAdapterInfo info;
+    memset(&info, 0xCC, sizeof(info));
+    EXPECT_EQ(S_OK, pHandle->QueryAdapterInfo(&info));
+    WiFiUserHandle::CloseHandle(pHandle);
+    EXPECT_STREQ(L"10.1.2.3", info.wszAddress);
+    EXPECT_EQ(0, info.rgbReserved[0]);
+}
+
 TEST_F(StandIns, TelvanectlRefusesBadWiFiCommands)
 {
     const wchar_t *rgwszCommands[] = {

@@ -70,12 +70,14 @@ TEST(UdpTestConfig, ResetAndInitialValues)
     UdpTestConfig config; // as the launcher is built: mains power, one test a day
     EXPECT_TRUE(config.acOnly);
     EXPECT_EQ(1.0f, config.maxTestDay);
-    // The rest of the reset record shows in its saved text and in the command line above.
-    config.localIp = "1.2.3.4";
+    // Every field changed, then reset: the command line shows nothing but the defaults.
+    config = {true, true, 5.0f, 6, 7, "1.2.3.4", 8, "relay", "::1", 9, 10, 11, 13, true};
     ResetUdpConfig(&config);
-    EXPECT_FALSE(config.acOnly);
+    std::string strLine;
+    EXPECT_EQ(" 0", BuildTestCommandLine(config, strLine));
+    EXPECT_FALSE(config.enabled || config.acOnly);
     EXPECT_EQ(0.0f, config.maxTestDay);
-    EXPECT_TRUE(config.localIp.empty());
+    EXPECT_EQ(0u, config.expiration + config.lastTest);
 }
 
 TEST(UdpRelayName, Rules)
