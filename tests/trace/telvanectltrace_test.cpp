@@ -3,19 +3,13 @@
 #include "service/ctracedocument.h"
 #include "service/tracesinks.h"
 
-#include "platform/deviceinfo/deviceinfocontrol.h"
-#include "platform/submission/submissioncontrol.h"
-#include "tests/common/testsupport.h"
-#include "tests/trace/tracetestsupport.h"
-
-#include <gtest/gtest.h>
+#include "tests/trace/deliverystate.h"
 
 #include <algorithm>
 #include <string>
 
+using namespace testsupport;
 using namespace tracetest;
-using testsupport::ChildResult;
-using testsupport::RunChild;
 
 namespace
 {
@@ -26,18 +20,12 @@ const GUID c_guidSession = {
 const GUID c_guidLog = {
     0x10101010, 0x1111, 0x4222, {0x83, 0x33, 0x44, 0x44, 0x44, 0x44, 0x44, 0x46}};
 
-class TelvanectlTraceTest : public testing::Test
-{
-protected:
-    void SetUp() override { ResetDeliveryState(); }
-    void TearDown() override { ResetDeliveryState(); }
-};
+using TelvanectlTraceTest = CDeliveryTest;
 
 // The child's output with its line ends as "\n" (the console runtime writes "\r\n").
 ChildResult Ctl(const std::wstring &wstrArguments)
 {
-    ChildResult result =
-        RunChild(L"\"" + testsupport::BinDir() + L"telvanectl.exe\" " + wstrArguments);
+    ChildResult result = RunTelvanectl(wstrArguments);
     result.strOutput.erase(std::remove(result.strOutput.begin(), result.strOutput.end(), '\r'),
                            result.strOutput.end());
     return result;
@@ -59,11 +47,10 @@ void DeliverTwoLogs()
     AllowDelivery(1);
     CTraceDocument document;
     document.Begin(c_guidActivity, c_guidSession, c_guidLog);
-    const char szEvent[] = "{\"Event\":\"Connect\",\"Rssi\":-61}";
-    document.RecordEvent(c_guidActivity, reinterpret_cast<const BYTE *>(szEvent), sizeof(szEvent));
+    Record(document, c_guidActivity, "{\"Event\":\"Connect\",\"Rssi\":-61}");
     document.FlushAndRestart(false);
-    SetDword(c_wszTestKey, c_wszTestValue, 2);
-    document.RecordEvent(c_guidLog, reinterpret_cast<const BYTE *>("[1,2]"), 5);
+    HklmSetDword(c_wszTestLoggingKey, c_wszTestLoggingValue, 2);
+    Record(document, c_guidLog, "[1,2]");
     document.AddExecutionTime();
     document.FlushAndRestart(true);
 }
@@ -73,15 +60,10 @@ TEST_F(TelvanectlTraceTest, ListShowsFilesAndSubmissionsNewestFirstAndSkipsParti
 {
     DeliverTwoLogs();
     // A file still being written under its temporary name is not a trace yet.
-    std::wstring wstrTemporary = std::wstring(TraceSinks::c_wszTraceDirectory) +
-                                 L"\\00000000-0000-0000-0000-000000000001" +
-                                 TraceSinks::c_wszTemporarySuffix;
-    HANDLE hFile = CreateFileW(wstrTemporary.c_str(), GENERIC_WRITE, 0, nullptr, CREATE_ALWAYS,
-                               FILE_ATTRIBUTE_NORMAL, nullptr);
-    ASSERT_NE(INVALID_HANDLE_VALUE, hFile);
-    DWORD cbWritten = 0;
-    WriteFile(hFile, "{\"Log", 5, &cbWritten, nullptr);
-    CloseHandle(hFile);
+    ASSERT_TRUE(WriteFileText(std::wstring(c_wszTraceFolder) +
+                                  L"\\00000000-0000-0000-0000-000000000001" +
+                                  TraceSinks::c_wszTemporarySuffix,
+                              "{\"Log"));
 
     ChildResult result = Ctl(L"trace list");
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
@@ -100,14 +82,13 @@ TEST_F(TelvanectlTraceTest, ListShowsFilesAndSubmissionsNewestFirstAndSkipsParti
 TEST_F(TelvanectlTraceTest, ShowPrintsTheSummaryAndTheIndentedTrace)
 {
     DeliverTwoLogs();
-    std::vector<std::wstring> rgNames = TraceFileNames();
+    std::vector<std::wstring> rgNames = FileNames(c_wszTraceFolder);
     ASSERT_EQ(2u, rgNames.size());
 
     // By LogID: every log of the run, in LogCount order (the second twice: file and
     // submission).
     std::string strLogId = GuidText(c_guidLog);
-    ChildResult result =
-        Ctl(std::wstring(L"trace show ") + std::wstring(strLogId.begin(), strLogId.end()));
+    ChildResult result = Ctl(L"trace show " + Widen(strLogId));
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
     EXPECT_EQ(3u, Count(result.strOutput, "Trace C:\\")) << result.strOutput;
     EXPECT_EQ(1u, Count(result.strOutput, "LogCount       1   LogEnd false")) << result.strOutput;
@@ -128,8 +109,7 @@ TEST_F(TelvanectlTraceTest, ShowPrintsTheSummaryAndTheIndentedTrace)
     result = Ctl(L"trace show " + rgNames[0]);
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
     EXPECT_EQ(1u, Count(result.strOutput, "Trace C:\\Data\\Test\\WiFiLog\\"));
-    result =
-        Ctl(L"trace show " + std::wstring(TraceSinks::c_wszTraceDirectory) + L"\\" + rgNames[1]);
+    result = Ctl(L"trace show " + std::wstring(c_wszTraceFolder) + L"\\" + rgNames[1]);
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
 
     result = Ctl(L"trace show 99999999-0000-0000-0000-000000000000");
@@ -172,7 +152,7 @@ TEST_F(TelvanectlTraceTest, PlatformCommandsDriveTheStandIns)
     EXPECT_EQ(0u, SubmissionGetResult(c_wszSubmissionInitResult));
 
     AllowDelivery(2);
-    document.RecordEvent(c_guidLog, reinterpret_cast<const BYTE *>("1"), 1);
+    Record(document, c_guidLog, "1");
     document.FlushAndRestart(true);
     result = Ctl(L"platform submission list");
     EXPECT_NE(std::string::npos, result.strOutput.find("1 submission(s)")) << result.strOutput;

@@ -5,16 +5,15 @@
 #include "service/ctracedocument.h"
 
 #include "lib/jsonreader.h"
-#include "platform/deviceinfo/deviceinfocontrol.h"
-#include "tests/trace/tracetestsupport.h"
-
-#include <gtest/gtest.h>
+#include "tests/common/tracesession.h"
+#include "tests/trace/deliverystate.h"
 
 #include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
 
+using namespace testsupport;
 using namespace tracetest;
 
 namespace
@@ -31,17 +30,12 @@ const GUID c_guidEventB = {
     0xbbbbbbbb, 0x0000, 0x4000, {0x80, 0x00, 0x00, 0x00, 0x00, 0x00, 0x00, 0x0b}};
 const GUID c_guidZero = {};
 
-const char c_szNotTerminated[] =
-    "**Event sent that is not null terminated,  this is safe but a perf hit";
-const char c_szReplaced[] =
-    "CServiceOperation::RecordEvent() - ***value is not one JSON text, recorded as a string";
+const std::string c_strNotTerminated =
+    "1001|**Event sent that is not null terminated,  this is safe but a perf hit";
+const std::string c_strReplaced =
+    "1001|CServiceOperation::RecordEvent() - ***value is not one JSON text, recorded as a string";
 
-class TraceDocumentTest : public testing::Test
-{
-protected:
-    void SetUp() override { ResetDeliveryState(); }
-    void TearDown() override { ResetDeliveryState(); }
-};
+using TraceDocumentTest = CDeliveryTest;
 
 // Now, cut to the millisecond as the trace's clock (GetSystemTime) has it.
 ULONGLONG NowFileTime()
@@ -52,69 +46,9 @@ ULONGLONG NowFileTime()
     return ull - ull % 10000;
 }
 
-void Record(CTraceDocument &document, const GUID &id, const std::string &strBytes)
+std::string Group(const GUID &id)
 {
-    document.RecordEvent(id, reinterpret_cast<const BYTE *>(strBytes.data()), strBytes.size());
-}
-
-// The text a rapidjson value has in the document, for comparing member values compactly.
-std::string Compact(const rapidjson::Value &value);
-
-std::string Compact(const rapidjson::Value &value)
-{
-    if (value.IsString())
-    {
-        return "\"" + std::string(value.GetString(), value.GetStringLength()) + "\"";
-    }
-    if (value.IsBool())
-    {
-        return value.GetBool() ? "true" : "false";
-    }
-    if (value.IsNull())
-    {
-        return "null";
-    }
-    if (value.IsUint64())
-    {
-        return std::to_string(value.GetUint64());
-    }
-    if (value.IsNumber())
-    {
-        char sz[64];
-        snprintf(sz, sizeof(sz), "%.12g", value.GetDouble());
-        return sz;
-    }
-    std::string str;
-    if (value.IsArray())
-    {
-        str = "[";
-        for (rapidjson::SizeType i = 0; i < value.Size(); i++)
-        {
-            str += (i > 0 ? "," : "") + Compact(value[i]);
-        }
-        return str + "]";
-    }
-    str = "{";
-    for (auto it = value.MemberBegin(); it != value.MemberEnd(); ++it)
-    {
-        str += (it == value.MemberBegin() ? "\"" : ",\"") + std::string(it->name.GetString()) +
-               "\":" + Compact(it->value);
-    }
-    return str + "}";
-}
-
-// The "Orvex" members as the platform reports the version.
-void ExpectOrvex(const rapidjson::Value &orvex)
-{
-    OSVERSIONINFOW version = {};
-    version.dwOSVersionInfoSize = sizeof(version);
-    ASSERT_TRUE(GetVersionExW(&version));
-    ASSERT_EQ((std::vector<std::string>{"Major", "Minor", "Build", "PlatformId"}),
-              MemberNames(orvex));
-    EXPECT_EQ(version.dwMajorVersion, orvex["Major"].GetDouble());
-    EXPECT_EQ(version.dwMinorVersion, orvex["Minor"].GetDouble());
-    EXPECT_EQ(version.dwBuildNumber, orvex["Build"].GetDouble());
-    EXPECT_EQ(version.dwPlatformId, orvex["PlatformId"].GetDouble());
+    return "ID" + GuidText(id);
 }
 
 void ExpectHeader(const rapidjson::Document &trace, unsigned uLogCount, ULONGLONG ullBefore,
@@ -129,29 +63,27 @@ void ExpectHeader(const rapidjson::Document &trace, unsigned uLogCount, ULONGLON
     ASSERT_TRUE(trace["TimeStamp"].IsUint64());
     EXPECT_LE(ullBefore, trace["TimeStamp"].GetUint64());
     EXPECT_GE(ullAfter, trace["TimeStamp"].GetUint64());
-    ExpectOrvex(trace["Orvex"]);
     EXPECT_TRUE(trace["Phone"].IsObject());
-}
-
-// The records of a group: their "Value" texts in order; each record is {TimeStamp, Value}.
-std::vector<std::string> GroupValues(const rapidjson::Value &group)
-{
-    std::vector<std::string> rgValues;
-    EXPECT_TRUE(group.IsArray());
-    for (rapidjson::SizeType i = 0; group.IsArray() && i < group.Size(); i++)
+    // "Orvex" is the version as the platform reports it.
+    OSVERSIONINFOW version = {};
+    version.dwOSVersionInfoSize = sizeof(version);
+    ASSERT_TRUE(GetVersionExW(&version));
+    const rapidjson::Value &orvex = trace["Orvex"];
+    ASSERT_EQ((std::vector<std::string>{"Major", "Minor", "Build", "PlatformId"}),
+              MemberNames(orvex));
+    const DWORD rgdwVersion[] = {version.dwMajorVersion, version.dwMinorVersion,
+                                 version.dwBuildNumber, version.dwPlatformId};
+    for (int i = 0; i < 4; i++)
     {
-        EXPECT_EQ((std::vector<std::string>{"TimeStamp", "Value"}), MemberNames(group[i]));
-        EXPECT_TRUE(group[i]["TimeStamp"].IsUint64());
-        rgValues.push_back(Compact(group[i]["Value"]));
+        EXPECT_EQ(rgdwVersion[i], orvex.MemberBegin()[i].value.GetDouble()) << i;
     }
-    return rgValues;
 }
 } // namespace
 
 TEST_F(TraceDocumentTest, FirstAndLaterLogsKeepTheirMemberOrder)
 {
     AllowDelivery(1);
-    TraceSession session;
+    CTraceSession session;
     ULONGLONG ullBefore = NowFileTime();
     CTraceDocument document;
     document.Begin(c_guidActivity, c_guidSession, c_guidLog);
@@ -170,82 +102,70 @@ TEST_F(TraceDocumentTest, FirstAndLaterLogsKeepTheirMemberOrder)
     ULONGLONG ullAfter = NowFileTime();
     EXPECT_EQ(3u, document.LogCount());
     // Every payload whose last byte is not its NUL, also one cut at an inner NUL.
-    EXPECT_EQ(3u, session.CountMessages(c_szNotTerminated));
-    EXPECT_EQ(0u, session.CountMessages(c_szReplaced));
+    EXPECT_EQ(3u, session.CountLines(c_strNotTerminated));
+    EXPECT_EQ(0u, session.CountLines(c_strReplaced));
 
-    std::vector<std::string> rgTexts = TraceFileTexts();
-    ASSERT_EQ(2u, rgTexts.size());
-    EXPECT_EQ(2u, TraceFileNames().size());
+    std::vector<DeliveredLog> rgLogs = DeliveredLogs();
+    ASSERT_EQ(2u, rgLogs.size());
+    EXPECT_EQ(2u, FileNames(c_wszTraceFolder).size());
 
-    rapidjson::Document first;
-    ParseStrict(rgTexts[0], first);
+    const rapidjson::Document &first = *rgLogs[0].doc;
     std::vector<std::string> rgNames = MemberNames(first);
     ASSERT_EQ(12u, rgNames.size());
-    // The iteration order of the groups is free.
-    std::vector<std::string> rgGroups(rgNames.begin() + 9, rgNames.begin() + 11);
-    std::sort(rgGroups.begin(), rgGroups.end());
-    rgNames.erase(rgNames.begin() + 9, rgNames.begin() + 11);
-    EXPECT_EQ(
-        (std::vector<std::string>{"ActivityID", "SessionID", "JsonVersion", "LogID", "WiFiConnID",
-                                  "LogCount", "TimeStamp", "Orvex", "Phone", "LogEnd"}),
-        rgNames);
-    std::string strGroupA = "ID" + GuidText(c_guidEventA);
-    std::string strGroupB = "ID" + GuidText(c_guidEventB);
-    EXPECT_EQ((std::vector<std::string>{strGroupA, strGroupB}), rgGroups);
+    std::sort(rgNames.begin() + 9, rgNames.begin() + 11); // the groups come in any order
+    EXPECT_EQ((std::vector<std::string>{"ActivityID", "SessionID", "JsonVersion", "LogID",
+                                        "WiFiConnID", "LogCount", "TimeStamp", "Orvex", "Phone",
+                                        Group(c_guidEventA), Group(c_guidEventB), "LogEnd"}),
+              rgNames);
     ExpectHeader(first, 1, ullBefore, ullMiddle);
-    EXPECT_EQ((std::vector<std::string>{"{\"n\":1}", "[2]"}),
-              GroupValues(first[strGroupA.c_str()]));
-    EXPECT_EQ((std::vector<std::string>{"\"b\""}), GroupValues(first[strGroupB.c_str()]));
+    EXPECT_EQ((std::vector<std::string>{"{\"n\":1}", "[2]"}), GroupValues(first, c_guidEventA));
+    EXPECT_EQ((std::vector<std::string>{"\"b\""}), GroupValues(first, c_guidEventB));
     EXPECT_FALSE(first["LogEnd"].GetBool());
-    // The records' own stamps lie within the log's life.
-    EXPECT_LE(first["TimeStamp"].GetUint64(), first[strGroupA.c_str()][0]["TimeStamp"].GetUint64());
+    // A record is {TimeStamp, Value}, stamped within the log's life.
+    const rapidjson::Value &record = first[Group(c_guidEventA).c_str()][0];
+    EXPECT_EQ((std::vector<std::string>{"TimeStamp", "Value"}), MemberNames(record));
+    EXPECT_LE(first["TimeStamp"].GetUint64(), record["TimeStamp"].GetUint64());
 
-    rapidjson::Document later;
-    ParseStrict(rgTexts[1], later);
-    std::string strGroupZero = "ID00000000-0000-0000-0000-000000000000";
+    const rapidjson::Document &later = *rgLogs[1].doc;
     EXPECT_EQ((std::vector<std::string>{"ActivityID", "SessionID", "LogID", "WiFiConnID",
                                         "LogCount", "JsonVersion", "TimeStamp", "Orvex", "Phone",
-                                        "ExecutionTime", strGroupZero, "LogEnd"}),
+                                        "ExecutionTime", Group(c_guidZero), "LogEnd"}),
               MemberNames(later));
     ExpectHeader(later, 2, ullBefore, ullAfter);
     EXPECT_LE(later["TimeStamp"].GetUint64(), later["ExecutionTime"].GetUint64());
     EXPECT_GE(ullAfter, later["ExecutionTime"].GetUint64());
-    EXPECT_EQ((std::vector<std::string>{"3"}), GroupValues(later[strGroupZero.c_str()]));
+    EXPECT_EQ((std::vector<std::string>{"3"}), GroupValues(later, c_guidZero));
     EXPECT_TRUE(later["LogEnd"].GetBool());
 }
 
 TEST_F(TraceDocumentTest, LogCountRisesAlsoForLogsThePreferenceStops)
 {
-    SetDword(c_wszTestKey, c_wszTestValue, 1);
+    HklmSetDword(c_wszTestLoggingKey, c_wszTestLoggingValue, 1);
     CTraceDocument document;
     document.Begin(c_guidActivity, c_guidSession, c_guidLog);
     Record(document, c_guidEventA, "1");
     document.FlushAndRestart(false); // no preference: dropped
     Record(document, c_guidEventA, "2");
-    SetDword(c_wszPreferenceKey, c_wszPreferenceValue, 1);
+    HklmSetDword(c_wszPreferenceKey, c_wszPreferenceValue, 1);
     document.FlushAndRestart(false); // bit 1 missing: dropped
-    EXPECT_TRUE(TraceFileNames().empty());
+    EXPECT_TRUE(FileNames(c_wszTraceFolder).empty());
     EXPECT_EQ(3u, document.LogCount());
 
     // The open log was begun as a later log, numbered past the two dropped ones; the dropped
-    // records went with their logs.
+    // records went with their logs (nine header members, nothing else).
     rapidjson::Document open;
     ParseStrict(document.CurrentText(), open);
     EXPECT_EQ(3u, open["LogCount"].GetUint());
-    EXPECT_FALSE(open.HasMember("LogEnd"));
     EXPECT_EQ(9u, MemberNames(open).size());
 
-    SetDword(c_wszPreferenceKey, c_wszPreferenceValue, 3);
+    HklmSetDword(c_wszPreferenceKey, c_wszPreferenceValue, 3);
     Record(document, c_guidEventA, "3");
     document.FlushAndRestart(true);
-    std::vector<std::string> rgTexts = TraceFileTexts();
-    ASSERT_EQ(1u, rgTexts.size());
-    rapidjson::Document delivered;
-    ParseStrict(rgTexts[0], delivered);
+    std::vector<DeliveredLog> rgLogs = DeliveredLogs();
+    ASSERT_EQ(1u, rgLogs.size());
+    const rapidjson::Document &delivered = *rgLogs[0].doc;
     EXPECT_EQ(3u, delivered["LogCount"].GetUint());
-    EXPECT_TRUE(delivered["LogEnd"].GetBool());
-    std::string strGroup = "ID" + GuidText(c_guidEventA);
-    EXPECT_EQ((std::vector<std::string>{"3"}), GroupValues(delivered[strGroup.c_str()]));
+    EXPECT_EQ((std::vector<std::string>{"3"}), GroupValues(delivered, c_guidEventA));
 }
 
 namespace
@@ -267,25 +187,13 @@ BOOL WINAPI FailOneConversion(const SYSTEMTIME *pst, FILETIME *pft)
 
 TEST_F(TraceDocumentTest, AFailedTimeConversionLeavesOutExactlyOneMember)
 {
-    struct Row
+    // Calls in order: 1 the header's TimeStamp, 2 the record's, 3 ExecutionTime; 0 none.
+    for (int iCall = 0; iCall <= 3; iCall++)
     {
-        int iFailingCall;
-        const char *szMissing; // member path that is left out, or null
-    };
-    // Calls in order: the header's TimeStamp, the record's, ExecutionTime.
-    const Row rgRows[] = {
-        {0, nullptr},
-        {1, "TimeStamp"},
-        {2, "record TimeStamp"},
-        {3, "ExecutionTime"},
-    };
-    std::string strGroup = "ID" + GuidText(c_guidEventA);
-    for (const Row &row : rgRows)
-    {
-        SCOPED_TRACE(row.iFailingCall);
+        SCOPED_TRACE(iCall);
         ResetDeliveryState();
         AllowDelivery(1);
-        s_iFailingCall = row.iFailingCall;
+        s_iFailingCall = iCall;
         s_cConversions = 0;
         CTraceDocument document;
         document.SetTimeConversion(FailOneConversion);
@@ -295,57 +203,49 @@ TEST_F(TraceDocumentTest, AFailedTimeConversionLeavesOutExactlyOneMember)
         document.FlushAndRestart(true);
         EXPECT_EQ(4, s_cConversions); // the next log's header asked too
 
-        std::vector<std::string> rgTexts = TraceFileTexts();
-        ASSERT_EQ(1u, rgTexts.size());
-        rapidjson::Document trace;
-        ParseStrict(rgTexts[0], trace);
-        std::vector<std::string> rgNames = MemberNames(trace);
-        const rapidjson::Value &record = trace[strGroup.c_str()][0];
-        bool fHeaderStamp = trace.HasMember("TimeStamp");
-        bool fRecordStamp = record.HasMember("TimeStamp");
-        bool fExecution = trace.HasMember("ExecutionTime");
-        std::string strMissing = !fHeaderStamp   ? "TimeStamp"
-                                 : !fRecordStamp ? "record TimeStamp"
-                                 : !fExecution   ? "ExecutionTime"
-                                                 : "";
-        EXPECT_EQ(row.szMissing != nullptr ? row.szMissing : "", strMissing);
-        EXPECT_EQ(3, fHeaderStamp + fRecordStamp + fExecution + (row.szMissing != nullptr));
-        EXPECT_EQ(row.iFailingCall == 1 || row.iFailingCall == 3 ? 11u : 12u, rgNames.size());
+        std::vector<DeliveredLog> rgLogs = DeliveredLogs();
+        ASSERT_EQ(1u, rgLogs.size());
+        const rapidjson::Document &trace = *rgLogs[0].doc;
+        const rapidjson::Value &record = trace[Group(c_guidEventA).c_str()][0];
+        EXPECT_EQ(iCall != 1, trace.HasMember("TimeStamp"));
+        EXPECT_EQ(iCall != 2, record.HasMember("TimeStamp"));
+        EXPECT_EQ(iCall != 3, trace.HasMember("ExecutionTime"));
+        EXPECT_EQ(iCall == 1 || iCall == 3 ? 11u : 12u, MemberNames(trace).size());
         EXPECT_TRUE(record.HasMember("Value"));
     }
 }
 
 TEST_F(TraceDocumentTest, RecordsOfOneIdShareOneArrayInOrder)
 {
+    // Enough groups to make the map grow past its first buckets.
+    auto id = [](int i) {
+        GUID guid = c_guidEventA;
+        guid.Data1 += static_cast<unsigned long>(i);
+        return guid;
+    };
     AllowDelivery(1);
     CTraceDocument document;
     document.Begin(c_guidActivity, c_guidSession, c_guidLog);
     for (int i = 0; i < 20; i++)
     {
-        // Enough groups to make the map grow past its first buckets.
-        GUID id = c_guidEventA;
-        id.Data1 += static_cast<unsigned long>(i % 10);
-        Record(document, id, std::to_string(i));
+        Record(document, id(i % 10), std::to_string(i));
     }
     document.FlushAndRestart(true);
-    std::vector<std::string> rgTexts = TraceFileTexts();
-    ASSERT_EQ(1u, rgTexts.size());
-    rapidjson::Document trace;
-    ParseStrict(rgTexts[0], trace);
+    std::vector<DeliveredLog> rgLogs = DeliveredLogs();
+    ASSERT_EQ(1u, rgLogs.size());
+    const rapidjson::Document &trace = *rgLogs[0].doc;
     EXPECT_EQ(9u + 10u + 1u, MemberNames(trace).size());
     for (int i = 0; i < 10; i++)
     {
-        GUID id = c_guidEventA;
-        id.Data1 += static_cast<unsigned long>(i);
-        std::string strGroup = "ID" + GuidText(id);
-        ASSERT_TRUE(trace.HasMember(strGroup.c_str()));
         EXPECT_EQ((std::vector<std::string>{std::to_string(i), std::to_string(i + 10)}),
-                  GroupValues(trace[strGroup.c_str()]));
+                  GroupValues(trace, id(i)));
     }
 }
 
 // Values that are one JSON text go in byte for byte; anything else becomes a JSON string of
-// its bytes, each byte of 0x80 and above as \u00XX, so the document stays JSON.
+// its bytes, each byte of 0x80 and above as \u00XX, so the document stays JSON. A value nested
+// so deep that the trace around it passes the depth our reader (and many others) will read
+// would make every other record of the log unreadable with it: it is kept as a string too.
 TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
 {
     struct Row
@@ -354,6 +254,11 @@ TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
         bool fKept;             // written unchanged
         std::string strWritten; // the value's text in the file
     };
+    // The trace's own levels around a value: the log, the group's array, the record.
+    const size_t cMaxValueDepth = JsonReader::c_cMaxDepth - 3;
+    auto nested = [](size_t cDepth) {
+        return std::string(cDepth, '[') + "1" + std::string(cDepth, ']');
+    };
     const Row rgRows[] = {
         {std::string("{\"a\":[1,2.5e-3,true,null,\"x\"]}\0", 31), true,
          "{\"a\":[1,2.5e-3,true,null,\"x\"]}"},
@@ -361,6 +266,8 @@ TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
         {"\"caf\xC3\xA9 \\u00e9 \\ud83d\\ude00\"", true, "\"caf\xC3\xA9 \\u00e9 \\ud83d\\ude00\""},
         {"-0.5E+2", true, "-0.5E+2"},
         {std::string("{\"a\":1}\0{\"b\":2}", 15), true, "{\"a\":1}"},
+        {nested(cMaxValueDepth), true, nested(cMaxValueDepth)},
+        {nested(cMaxValueDepth + 1), false, "\"" + nested(cMaxValueDepth + 1) + "\""},
         {"{\"a\":1}x", false, "\"{\\\"a\\\":1}x\""},
         {"1 2", false, "\"1 2\""},
         {"{\"a\":1", false, "\"{\\\"a\\\":1\""},
@@ -375,7 +282,7 @@ TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
         {"</script>", false, "\"<\\/script>\""},
     };
     AllowDelivery(1);
-    TraceSession session;
+    CTraceSession session;
     CTraceDocument document;
     document.Begin(c_guidActivity, c_guidSession, c_guidLog);
     size_t cReplaced = 0;
@@ -384,136 +291,78 @@ TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
         Record(document, c_guidEventA, row.strPayload);
         cReplaced += row.fKept ? 0 : 1;
     }
-    EXPECT_EQ(cReplaced, session.CountMessages(c_szReplaced));
+    EXPECT_EQ(cReplaced, session.CountLines(c_strReplaced));
     document.FlushAndRestart(true);
 
-    std::vector<std::string> rgTexts = TraceFileTexts();
-    ASSERT_EQ(1u, rgTexts.size());
-    rapidjson::Document trace;
-    ParseStrict(rgTexts[0], trace);
-    std::string strGroup = "ID" + GuidText(c_guidEventA);
-    const rapidjson::Value &group = trace[strGroup.c_str()];
+    std::vector<DeliveredLog> rgLogs = DeliveredLogs();
+    ASSERT_EQ(1u, rgLogs.size());
+    const rapidjson::Document &trace = *rgLogs[0].doc;
+    const std::string &strText = rgLogs[0].strText;
+    // Our own reader takes the whole trace, the deepest value kept included.
+    std::unique_ptr<JsonValue> root(JsonReader::FromJsonString(strText.c_str()));
+    EXPECT_EQ(JsonNodeType::Object, root->Type());
+    const rapidjson::Value &group = trace[Group(c_guidEventA).c_str()];
     ASSERT_EQ(sizeof(rgRows) / sizeof(rgRows[0]), group.Size());
-    // Each value's exact text sits between its "Value": and the record's closing brace.
+    // Each value's exact text sits between its "Value": and the record's closing brace (the
+    // strict parse above read every replacement string back).
     size_t pos = 0;
     for (size_t i = 0; i < group.Size(); i++)
     {
         const Row &row = rgRows[i];
-        SCOPED_TRACE(row.strWritten);
-        pos = rgTexts[0].find("\"Value\":", pos);
+        SCOPED_TRACE(row.strWritten.substr(0, 40));
+        pos = strText.find("\"Value\":", pos);
         ASSERT_NE(std::string::npos, pos);
         pos += 8;
-        EXPECT_EQ(row.strWritten + "}", rgTexts[0].substr(pos, row.strWritten.size() + 1));
-        const rapidjson::Value &value = group[static_cast<rapidjson::SizeType>(i)]["Value"];
-        if (!row.fKept)
-        {
-            // The string decodes to the kept bytes, each byte one character.
-            ASSERT_TRUE(value.IsString());
-            std::string strKept(row.strPayload.c_str());
-            std::string strExpected;
-            for (unsigned char b : strKept)
-            {
-                if (b < 0x80)
-                {
-                    strExpected += static_cast<char>(b);
-                }
-                else
-                {
-                    strExpected += static_cast<char>(0xC0 | (b >> 6));
-                    strExpected += static_cast<char>(0x80 | (b & 0x3F));
-                }
-            }
-            EXPECT_EQ(strExpected, std::string(value.GetString(), value.GetStringLength()));
-            for (char ch : row.strWritten)
-            {
-                EXPECT_LT(static_cast<unsigned char>(ch), 0x80);
-            }
-        }
+        EXPECT_EQ(row.strWritten + "}", strText.substr(pos, row.strWritten.size() + 1));
     }
-}
-
-// A value nested so deep that the trace around it passes the depth our reader (and many
-// others) will read would make every other record of the log unreadable with it: such a
-// value is kept as a string too.
-TEST_F(TraceDocumentTest, ValuesNestedPastTheReadersDepthBecomeStrings)
-{
-    // The trace's own levels: the log, the group's array, the record.
-    const size_t c_cValueDepth = JsonReader::c_cMaxDepth - 3;
-    auto nested = [](size_t cDepth) {
-        return std::string(cDepth, '[') + "1" + std::string(cDepth, ']');
-    };
-    AllowDelivery(1);
-    TraceSession session;
-    CTraceDocument document;
-    document.Begin(c_guidActivity, c_guidSession, c_guidLog);
-    Record(document, c_guidEventA, nested(c_cValueDepth));
-    Record(document, c_guidEventA, nested(c_cValueDepth + 1));
-    Record(document, c_guidEventA, nested(1000));
-    EXPECT_EQ(2u, session.CountMessages(c_szReplaced));
-    document.FlushAndRestart(true);
-
-    std::vector<std::string> rgTexts = TraceFileTexts();
-    ASSERT_EQ(1u, rgTexts.size());
-    std::unique_ptr<JsonValue> root(JsonReader::FromJsonString(rgTexts[0].c_str()));
-    ASSERT_EQ(JsonNodeType::Object, root->Type());
-    std::string strLogId;
-    EXPECT_TRUE(static_cast<const JsonObjectNode *>(root.get())->GetMemberText("LogID", strLogId));
-    EXPECT_EQ(GuidText(c_guidLog), strLogId);
-
-    rapidjson::Document trace;
-    ParseStrict(rgTexts[0], trace);
-    const rapidjson::Value &group = trace[("ID" + GuidText(c_guidEventA)).c_str()];
-    ASSERT_EQ(3u, group.Size());
-    EXPECT_TRUE(group[0]["Value"].IsArray());
-    EXPECT_EQ(nested(c_cValueDepth + 1), group[1]["Value"].GetString());
-    EXPECT_EQ(nested(1000), group[2]["Value"].GetString());
 }
 
 TEST_F(TraceDocumentTest, PhoneDescribesTheDeviceAsTheLibraryAnswers)
 {
+    // Members of "Phone" as name and JSON text; "-" for a member left out.
+    typedef std::vector<std::pair<std::string, std::string>> Members;
+    // The defaults in document order: the build record, then the items in item order.
+    Members rgDefaults = {{"Branch", "\"WPB_CXE_R1\""},
+                          {"TimeStamp", "\"151214-1700\""},
+                          {"ParentBranchBuild", "10586"},
+                          {"BuildNumber", "10586"},
+                          {"QFELevel", "107"},
+                          {"OV_MajorVersion", "10"},
+                          {"OV_MinorVersion", "0"}};
+    for (DWORD dwItem = 0; dwItem < 16; dwItem++)
+    {
+        for (const DEVICE_INFO_SETTING &setting : DeviceInfoGetSettings())
+        {
+            if (setting.wstrName == DeviceInfoItemName(dwItem))
+            {
+                rgDefaults.emplace_back(Narrow(setting.wstrName),
+                                        "\"" + Narrow(setting.wstrValue) + "\"");
+            }
+        }
+    }
     struct Row
     {
         const char *szCase;
         std::vector<std::wstring> rgFail;
         std::vector<std::pair<std::wstring, std::wstring>> rgSet;
-        // Members of "Phone" whose value differs from the defaults ("-" means absent).
-        std::vector<std::pair<std::string, std::string>> rgExpected;
+        Members rgChanged; // "*" stands for every member, "Build" for the build record's
     };
-    const std::wstring wstrLong(300, L'x');
-    const std::wstring wstrTooLongForTheBuffer(1024, L'y');
     const Row rgRows[] = {
+        // clang-format off
         {"defaults", {}, {}, {}},
         {"every call fails", {L"*"}, {}, {{"*", "-"}}},
-        {"build record fails",
-         {L"Build"},
-         {},
-         {{"Branch", "-"},
-          {"TimeStamp", "-"},
-          {"ParentBranchBuild", "-"},
-          {"BuildNumber", "-"},
-          {"QFELevel", "-"},
-          {"OV_MajorVersion", "-"},
-          {"OV_MinorVersion", "-"}}},
-        {"two items fail",
-         {L"Manufacturer", L"PhoneSOCVersion"},
-         {},
+        {"build record fails", {L"Build"}, {}, {{"Build", "-"}}},
+        {"two items fail", {L"Manufacturer", L"PhoneSOCVersion"}, {},
          {{"Manufacturer", "-"}, {"PhoneSOCVersion", "-"}}},
-        {"300-character friendly name",
-         {},
-         {{L"PhoneFriendlyName", wstrLong}},
+        {"300-character friendly name", {}, {{L"PhoneFriendlyName", std::wstring(300, L'x')}},
          {{"PhoneFriendlyName", "\"error\""}}},
-        {"friendly name outside ASCII",
-         {},
-         {{L"PhoneFriendlyName", L"Lumen \x00e9\x00e8"}},
+        {"friendly name outside ASCII", {}, {{L"PhoneFriendlyName", L"Lumen \x00e9\x00e8"}},
          {{"PhoneFriendlyName", "\"Lumen \xC3\xA9\xC3\xA8\""}}},
-        {"item longer than the buffer",
-         {},
-         {{L"PhoneModelName", wstrTooLongForTheBuffer}},
+        {"item longer than the buffer", {}, {{L"PhoneModelName", std::wstring(1024, L'y')}},
          {{"PhoneModelName", "-"}}},
-        {"build values set",
-         {},
-         {{L"Branch", L"rs_prerelease"}, {L"BuildNumber", L"4294967295"}},
+        {"build values set", {}, {{L"Branch", L"rs_prerelease"}, {L"BuildNumber", L"4294967295"}},
          {{"Branch", "\"rs_prerelease\""}, {"BuildNumber", "4294967295"}}},
+        // clang-format on
     };
     for (const Row &row : rgRows)
     {
@@ -527,60 +376,30 @@ TEST_F(TraceDocumentTest, PhoneDescribesTheDeviceAsTheLibraryAnswers)
         {
             ASSERT_TRUE(DeviceInfoSet(set.first, set.second));
         }
+        Members rgExpected;
+        for (size_t i = 0; i < rgDefaults.size(); i++)
+        {
+            std::string strValue = rgDefaults[i].second;
+            for (const auto &changed : row.rgChanged)
+            {
+                bool fMatch = changed.first == "*" || changed.first == rgDefaults[i].first ||
+                              (changed.first == "Build" && i < 7);
+                strValue = fMatch ? changed.second : strValue;
+            }
+            if (strValue != "-")
+            {
+                rgExpected.emplace_back(rgDefaults[i].first, strValue);
+            }
+        }
         CTraceDocument document;
         document.Begin(c_guidActivity, c_guidSession, c_guidLog);
         rapidjson::Document trace;
         ParseStrict(document.CurrentText(), trace);
         ASSERT_TRUE(trace.HasMember("Phone"));
-        const rapidjson::Value &phone = trace["Phone"];
-
-        // The defaults, in document order: the build record, then the items.
-        std::vector<std::pair<std::string, std::string>> rgExpected = {
-            {"Branch", "\"WPB_CXE_R1\""},
-            {"TimeStamp", "\"151214-1700\""},
-            {"ParentBranchBuild", "10586"},
-            {"BuildNumber", "10586"},
-            {"QFELevel", "107"},
-            {"OV_MajorVersion", "10"},
-            {"OV_MinorVersion", "0"},
-        };
-        for (DWORD dwItem = 0; dwItem < 16; dwItem++)
+        Members rgActual;
+        for (auto it = trace["Phone"].MemberBegin(); it != trace["Phone"].MemberEnd(); ++it)
         {
-            for (const DEVICE_INFO_SETTING &setting : DeviceInfoGetSettings())
-            {
-                if (setting.wstrName == DeviceInfoItemName(dwItem) && !setting.fOverridden)
-                {
-                    std::string strName(setting.wstrName.begin(), setting.wstrName.end());
-                    std::string strValue(setting.wstrValue.begin(), setting.wstrValue.end());
-                    rgExpected.emplace_back(strName, "\"" + strValue + "\"");
-                }
-                else if (setting.wstrName == DeviceInfoItemName(dwItem))
-                {
-                    std::string strName(setting.wstrName.begin(), setting.wstrName.end());
-                    rgExpected.emplace_back(strName, "?");
-                }
-            }
-        }
-        for (const auto &expected : row.rgExpected)
-        {
-            for (auto it = rgExpected.begin(); it != rgExpected.end();)
-            {
-                if (expected.first == "*" || it->first == expected.first)
-                {
-                    if (expected.second == "-")
-                    {
-                        it = rgExpected.erase(it);
-                        continue;
-                    }
-                    it->second = expected.second;
-                }
-                ++it;
-            }
-        }
-        std::vector<std::pair<std::string, std::string>> rgActual;
-        for (auto it = phone.MemberBegin(); it != phone.MemberEnd(); ++it)
-        {
-            rgActual.emplace_back(it->name.GetString(), Compact(it->value));
+            rgActual.emplace_back(it->name.GetString(), JsonText(it->value));
         }
         EXPECT_EQ(rgExpected, rgActual);
     }
@@ -612,32 +431,26 @@ TEST_F(TraceDocumentTest, ConnIdGivesTheConnectionOrTheZeroGuid)
     for (const Row &row : rgRows)
     {
         SCOPED_TRACE(row.szCase);
-        DeleteKey(c_wszConnIdKey);
+        HklmDeleteKey(c_wszConnIdKey);
         if (row.iKind >= 1)
         {
-            SetString(c_wszConnIdKey, L"Other", L"x");
+            HklmSetString(c_wszConnIdKey, L"Other", L"x");
         }
         if (row.iKind == 2)
         {
-            SetString(c_wszConnIdKey, c_wszConnIdValue, row.wstrValue);
+            HklmSetString(c_wszConnIdKey, c_wszConnIdValue, row.wstrValue);
         }
         else if (row.iKind == 3)
         {
-            HKEY hKey = nullptr;
-            ASSERT_EQ(ERROR_SUCCESS,
-                      RegOpenKeyExW(HKEY_LOCAL_MACHINE, c_wszConnIdKey, 0, KEY_WRITE, &hKey));
-            RegSetValueExW(hKey, c_wszConnIdValue, 0, REG_BINARY,
-                           reinterpret_cast<const BYTE *>(row.wstrValue.c_str()),
-                           static_cast<DWORD>(row.wstrValue.size() * sizeof(wchar_t)));
-            RegCloseKey(hKey);
+            HklmSetBytes(c_wszConnIdKey, c_wszConnIdValue, REG_BINARY, row.wstrValue.c_str(),
+                         static_cast<DWORD>(row.wstrValue.size() * sizeof(wchar_t)));
         }
-        std::wstring wstrConnId = CTraceDocument::ReadWiFiConnId();
-        EXPECT_EQ(row.strExpected, std::string(wstrConnId.begin(), wstrConnId.end()));
+        EXPECT_EQ(row.strExpected, Narrow(CTraceDocument::ReadWiFiConnId()));
         CTraceDocument document;
         document.Begin(c_guidActivity, c_guidSession, c_guidLog);
         rapidjson::Document trace;
         ParseStrict(document.CurrentText(), trace);
         EXPECT_EQ(row.strExpected, trace["WiFiConnID"].GetString());
     }
-    DeleteKey(c_wszConnIdKey);
+    HklmDeleteKey(c_wszConnIdKey);
 }

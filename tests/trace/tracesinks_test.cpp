@@ -5,18 +5,15 @@
 #include "service/tracesinks.h"
 
 #include "inc/handleholder.h"
-#include "platform/submission/submissioncontrol.h"
-#include "tests/trace/tracetestsupport.h"
-
-#include <rpc.h>
-
-#include <gtest/gtest.h>
+#include "tests/common/tracesession.h"
+#include "tests/trace/deliverystate.h"
 
 #include <algorithm>
 #include <string>
 #include <thread>
 #include <vector>
 
+using namespace testsupport;
 using namespace tracetest;
 
 namespace
@@ -28,28 +25,23 @@ const GUID c_guidSession = {
 const GUID c_guidLog = {
     0xcccccccc, 0xdddd, 0x4eee, {0x8f, 0xff, 0x00, 0x11, 0x22, 0x33, 0x44, 0x55}};
 
-const char c_szReadingPreference[] = "CServiceOperation::Reading User Preference key";
-const char c_szReadingTest[] = "CServiceOperation::Reading Test Registry key";
-const char c_szJustFile[] = "CServiceOperation::Test Registry key value set, sending to just file";
-const char c_szBoth[] =
-    "CServiceOperation::Test Registry key value set, sending to both file and Vantor";
-const char c_szWritingFile[] = "CServiceOperation::Writing trace to filesystem";
-const char c_szWritingVantor[] = "CServiceOperation::Writing trace to Vantor";
+const std::string c_strReadingPreference = "1001|CServiceOperation::Reading User Preference key";
+const std::string c_strReadingTest = "1001|CServiceOperation::Reading Test Registry key";
+const std::string c_strJustFile =
+    "1001|CServiceOperation::Test Registry key value set, sending to just file";
+const std::string c_strBoth =
+    "1001|CServiceOperation::Test Registry key value set, sending to both file and Vantor";
+const std::string c_strWritingFile = "1001|CServiceOperation::Writing trace to filesystem";
+const std::string c_strWritingVantor = "1001|CServiceOperation::Writing trace to Vantor";
 
-class TraceSinksTest : public testing::Test
-{
-protected:
-    void SetUp() override { ResetDeliveryState(); }
-    void TearDown() override { ResetDeliveryState(); }
-};
+using TraceSinksTest = CDeliveryTest;
 
 // One log with one record, flushed as the final log.
 void FlushOneLog()
 {
     CTraceDocument document;
     document.Begin(c_guidActivity, c_guidSession, c_guidLog);
-    const char szEvent[] = "{\"Event\":\"Connect\"}";
-    document.RecordEvent(c_guidActivity, reinterpret_cast<const BYTE *>(szEvent), sizeof(szEvent));
+    Record(document, c_guidActivity, std::string("{\"Event\":\"Connect\"}", 20));
     document.FlushAndRestart(true);
 }
 
@@ -64,30 +56,29 @@ std::vector<std::string> JournalCalls()
     return rgCalls;
 }
 
-// A registry value's state before a flush: missing, a DWORD, or a string.
+// A registry value's state before a flush: 0 value missing, 1 a DWORD, 2 the number as a
+// REG_SZ, 3 key missing (only for keys no one else uses: the service's own Parameters key
+// also holds its installation).
 struct ValueState
 {
-    // 0: value missing, 1: DWORD, 2: REG_SZ, 3: key missing (only for keys no one else uses:
-    // the service's own Parameters key also holds its installation)
     int iKind;
     DWORD dwValue;
 };
 
 void Apply(const wchar_t *wszKey, const wchar_t *wszValue, const ValueState &state)
 {
+    HklmDeleteValue(wszKey, wszValue);
     if (state.iKind == 3)
     {
-        DeleteKey(wszKey);
-        return;
+        HklmDeleteKey(wszKey);
     }
-    DeleteValue(wszKey, wszValue);
-    if (state.iKind == 1)
+    else if (state.iKind == 1)
     {
-        SetDword(wszKey, wszValue, state.dwValue);
+        HklmSetDword(wszKey, wszValue, state.dwValue);
     }
     else if (state.iKind == 2)
     {
-        SetString(wszKey, wszValue, std::to_wstring(state.dwValue));
+        HklmSetString(wszKey, wszValue, std::to_wstring(state.dwValue));
     }
 }
 } // namespace
@@ -95,7 +86,6 @@ void Apply(const wchar_t *wszKey, const wchar_t *wszValue, const ValueState &sta
 TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
 {
     const ValueState c_missing = {0, 0};
-    const ValueState c_keyMissing = {3, 0};
     auto dword = [](DWORD dw) { return ValueState{1, dw}; };
     auto text = [](DWORD dw) { return ValueState{2, dw}; };
     struct Row
@@ -107,7 +97,7 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
         size_t cSubmissions;
     };
     const Row rgRows[] = {
-        {"preference key missing", c_keyMissing, dword(2), 0, 0},
+        {"preference key missing", {3, 0}, dword(2), 0, 0},
         {"preference missing", c_missing, dword(2), 0, 0},
         {"preference 1", dword(1), dword(2), 0, 0},
         {"preference 2", dword(2), dword(2), 0, 0},
@@ -130,35 +120,31 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
         SCOPED_TRACE(row.szCase);
         ResetDeliveryState();
         Apply(c_wszPreferenceKey, c_wszPreferenceValue, row.preference);
-        Apply(c_wszTestKey, c_wszTestValue, row.testLogging);
-        TraceSession session;
+        Apply(c_wszTestLoggingKey, c_wszTestLoggingValue, row.testLogging);
+        CTraceSession session;
         FlushOneLog();
 
-        std::vector<std::string> rgFiles = TraceFileTexts();
+        std::vector<DeliveredLog> rgFiles = DeliveredLogs();
         std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
         EXPECT_EQ(row.cFiles, rgFiles.size());
         EXPECT_EQ(row.cSubmissions, rgSubmissions.size());
         bool fAllowed = (row.preference.iKind == 1 && (row.preference.dwValue & 3) == 3) ||
                         (row.preference.iKind == 2 && row.preference.dwValue == 3);
-        EXPECT_EQ(1u, session.CountMessages(c_szReadingPreference));
-        EXPECT_EQ(fAllowed ? 1u : 0u, session.CountMessages(c_szReadingTest));
-        EXPECT_EQ(row.cFiles, session.CountMessages(c_szWritingFile));
-        EXPECT_EQ(row.cSubmissions, session.CountMessages(c_szWritingVantor));
+        bool fBoth = row.cFiles == 1 && row.cSubmissions == 1;
+        EXPECT_EQ(1u, session.CountLines(c_strReadingPreference));
+        EXPECT_EQ(fAllowed ? 1u : 0u, session.CountLines(c_strReadingTest));
+        EXPECT_EQ(row.cFiles, session.CountLines(c_strWritingFile));
+        EXPECT_EQ(row.cSubmissions, session.CountLines(c_strWritingVantor));
         EXPECT_EQ(row.cFiles == 1 && row.cSubmissions == 0 ? 1u : 0u,
-                  session.CountMessages(c_szJustFile));
-        EXPECT_EQ(row.cFiles == 1 && row.cSubmissions == 1 ? 1u : 0u,
-                  session.CountMessages(c_szBoth));
-        // File and submission carry the same text: the log with "LogEnd"; the file comes
-        // first.
-        if (row.cFiles == 1 && row.cSubmissions == 1)
+                  session.CountLines(c_strJustFile));
+        EXPECT_EQ(fBoth ? 1u : 0u, session.CountLines(c_strBoth));
+        // File and submission carry the same text, the final log's; the file comes first.
+        if (fBoth)
         {
-            EXPECT_EQ(rgFiles[0], rgSubmissions[0].strData);
+            EXPECT_EQ(rgFiles[0].strText, rgSubmissions[0].strData);
             std::vector<std::string> rgLines = session.Lines();
-            auto itFile =
-                std::find(rgLines.begin(), rgLines.end(), std::string("1001|") + c_szWritingFile);
-            auto itVantor =
-                std::find(rgLines.begin(), rgLines.end(), std::string("1001|") + c_szWritingVantor);
-            EXPECT_LT(itFile, itVantor);
+            EXPECT_LT(std::find(rgLines.begin(), rgLines.end(), c_strWritingFile),
+                      std::find(rgLines.begin(), rgLines.end(), c_strWritingVantor));
         }
         for (const SUBMISSION_RECORD &submission : rgSubmissions)
         {
@@ -169,67 +155,34 @@ TEST_F(TraceSinksTest, TheTwoValuesChooseTheSinks)
     }
 }
 
-TEST_F(TraceSinksTest, WithoutTheTestFolderNoFileIsWrittenAndTheSubmissionStillHappens)
+// A failing file sink stops only the file: without C:\Data\Test (only the last folder is
+// made: a device without it is not a test device), or with a file named like the folder (used
+// unchanged, and every open under it fails).
+TEST_F(TraceSinksTest, AFailingFileSinkStopsOnlyTheFile)
 {
-    RemoveDirectoryTree(L"C:\\Data\\Test");
-    AllowDelivery(2);
-    TraceSession session;
+    RemoveTree(L"C:\\Data\\Test");
+    HklmSetDword(c_wszPreferenceKey, c_wszPreferenceValue, 3);
+    HklmSetDword(c_wszTestLoggingKey, c_wszTestLoggingValue, 2);
+    CTraceSession session;
     FlushOneLog();
     EXPECT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(L"C:\\Data\\Test"));
-    EXPECT_EQ(1u, session.CountMessages(c_szWritingFile));
+    EXPECT_EQ(1u, session.CountLines(c_strWritingFile));
     EXPECT_EQ(1u, SubmissionList().size());
 
-    // Only the last folder is made: with its parent back, the folder appears.
-    CreateDirectoryW(L"C:\\Data\\Test", nullptr);
-    FlushOneLog();
-    EXPECT_EQ(1u, TraceFileNames().size());
-    EXPECT_EQ(2u, SubmissionList().size());
-}
-
-TEST_F(TraceSinksTest, EachLogGetsANewFileNamedByAGuid)
-{
-    AllowDelivery(1);
-    CTraceDocument document;
-    document.Begin(c_guidActivity, c_guidSession, c_guidLog);
-    for (int i = 0; i < 2; i++)
-    {
-        document.RecordEvent(c_guidLog, reinterpret_cast<const BYTE *>("1"), 1);
-        document.FlushAndRestart(i == 1);
-    }
-    std::vector<std::wstring> rgNames = TraceFileNames();
-    ASSERT_EQ(2u, rgNames.size());
-    for (const std::wstring &wstrName : rgNames)
-    {
-        // Lower-case 8-4-4-4-12, no braces, no extension, and nothing temporary left.
-        ASSERT_EQ(36u, wstrName.size());
-        GUID guid;
-        EXPECT_EQ(RPC_S_OK,
-                  UuidFromStringW(
-                      reinterpret_cast<RPC_WSTR>(const_cast<wchar_t *>(wstrName.c_str())), &guid));
-        EXPECT_EQ(std::string(wstrName.begin(), wstrName.end()), GuidText(guid));
-    }
-    std::vector<std::string> rgTexts = TraceFileTexts();
-    ASSERT_EQ(2u, rgTexts.size());
-    // The file holds the text and nothing else: no BOM, no terminator, no line end.
-    EXPECT_EQ('{', rgTexts[0].front());
-    EXPECT_EQ('}', rgTexts[0].back());
-}
-
-TEST_F(TraceSinksTest, AFolderInTheWayOrAFileNamedLikeTheFolderStopsOnlyTheFile)
-{
-    // "WiFiLog" exists as a file: it is used unchanged and every open under it fails.
-    HANDLE hFile = CreateFileW(TraceSinks::c_wszTraceDirectory, GENERIC_WRITE, 0, nullptr,
-                               CREATE_ALWAYS, FILE_ATTRIBUTE_NORMAL, nullptr);
-    ASSERT_NE(INVALID_HANDLE_VALUE, hFile);
-    CloseHandle(hFile);
+    CreateFolders(L"C:\\Data\\Test");
+    ASSERT_TRUE(WriteFileText(c_wszTraceFolder, ""));
     std::wstring wstrPath;
     EXPECT_EQ(S_OK, TraceSinks::MakeTraceFileName(wstrPath));
-    EXPECT_EQ(0u, wstrPath.find(std::wstring(TraceSinks::c_wszTraceDirectory) + L"\\"));
+    EXPECT_EQ(0u, wstrPath.find(std::wstring(c_wszTraceFolder) + L"\\"));
     EXPECT_TRUE(FAILED(TraceSinks::WriteTraceToFile("{}", 2)));
-    AllowDelivery(2);
     FlushOneLog();
-    EXPECT_EQ(1u, SubmissionList().size());
-    DeleteFileW(TraceSinks::c_wszTraceDirectory);
+    EXPECT_EQ(2u, SubmissionList().size());
+    DeleteFileW(c_wszTraceFolder);
+
+    // With its parent there, the folder appears.
+    FlushOneLog();
+    EXPECT_EQ(1u, FileNames(c_wszTraceFolder).size());
+    EXPECT_EQ(3u, SubmissionList().size());
 }
 
 // Operations flush on their own threads: when the folder is missing, several of them may
@@ -241,7 +194,7 @@ TEST_F(TraceSinksTest, FlushesRacingToCreateTheFolderAllGetAName)
     int cFailed = 0;
     for (int iRound = 0; iRound < c_cRounds; iRound++)
     {
-        RemoveDirectoryTree(TraceSinks::c_wszTraceDirectory);
+        RemoveTree(TraceSinks::c_wszTraceDirectory);
         ASSERT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(TraceSinks::c_wszTraceDirectory));
         CKernelHandle start(CreateEventW(nullptr, TRUE, FALSE, nullptr));
         ASSERT_TRUE(start.IsValid());
@@ -265,95 +218,75 @@ TEST_F(TraceSinksTest, FlushesRacingToCreateTheFolderAllGetAName)
     EXPECT_EQ(0, cFailed) << "of " << c_cRounds * c_cThreads;
 }
 
-TEST_F(TraceSinksTest, TheSubmissionCarriesTheProfileInTheLibrarysCallOrder)
+// The library's calls in its order whatever fails, the submitter and the profile destroyed on
+// every path; a failure is traced with the code that failed.
+TEST_F(TraceSinksTest, TheSubmissionFollowsTheLibrarysCallOrder)
 {
-    AllowDelivery(2);
-    FlushOneLog();
-    std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
-    ASSERT_EQ(1u, rgSubmissions.size());
-    const SUBMISSION_RECORD &submission = rgSubmissions[0];
-    EXPECT_EQ("ZARI_DavoDuvuri_Z1", submission.strProfileName);
-    EXPECT_EQ("null 0 null", submission.strTarget);
-    EXPECT_EQ("null", submission.strGuid);
-    const DWORD rgdwSettings[8] = {0xFFFFFFFF, 1, 1, 0, 1, 1, 4096, 500};
-    for (int i = 0; i < 8; i++)
+    struct Row
     {
-        EXPECT_EQ(rgdwSettings[i], submission.rgdwSettings[i]) << i;
+        DWORD dwInit;
+        DWORD dwSubmit;
+        std::vector<std::string> rgCalls; // between the constructors and the destructors
+        const char *szFailure;
+    };
+    // "%" stands for the text's length.
+    const Row rgRows[] = {
+        {0x1234, 0, {"Init() = 0x1234"}, "1002|Vantor Init()|1234"},
+        {0,
+         ERROR_NOT_ENOUGH_MEMORY,
+         {"Init() = 0x0", "SubmitData(% bytes, null) = 0x8"},
+         "1002|Vantor SubmitData()|8"},
+        {0x5, 0x6, {"Init() = 0x5"}, "1002|Vantor Init()|5"},
+        {0, 0, {"Init() = 0x0", "SubmitData(% bytes, null) = 0x0"}, nullptr},
+    };
+    for (const Row &row : rgRows)
+    {
+        SCOPED_TRACE(row.rgCalls.back());
+        ResetDeliveryState();
+        AllowDelivery(2);
+        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionInitResult, row.dwInit));
+        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionSubmitResult, row.dwSubmit));
+        CTraceSession session;
+        FlushOneLog();
+        std::vector<DeliveredLog> rgFiles = DeliveredLogs();
+        ASSERT_EQ(1u, rgFiles.size());
+        std::vector<std::string> rgExpected = {
+            "CrowdsourcingProfile_t()", "CrowdsourcingDataSubmitter_t(profile, null 0 null)"};
+        for (std::string strCall : row.rgCalls)
+        {
+            size_t pos = strCall.find('%');
+            rgExpected.push_back(
+                pos == std::string::npos
+                    ? strCall
+                    : strCall.replace(pos, 1, std::to_string(rgFiles[0].strText.size())));
+        }
+        rgExpected.push_back("~CrowdsourcingDataSubmitter_t()");
+        rgExpected.push_back("~CrowdsourcingProfile_t()");
+        EXPECT_EQ(rgExpected, JournalCalls());
+        bool fFails = row.szFailure != nullptr;
+        EXPECT_EQ(fFails ? 1u : 0u, session.CountLines(fFails ? row.szFailure : ""));
+        EXPECT_EQ(fFails ? 1u : 0u,
+                  session.Count("Vantor Init()") + session.Count("Vantor SubmitData()"));
+        EXPECT_EQ(fFails ? 0u : 1u, SubmissionList().size());
     }
 
     // The 120 bytes as the library received them: the name with zeros to 64 bytes, the
     // eight settings, and the library's 24 bytes as its constructor left them.
+    std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
+    ASSERT_EQ(1u, rgSubmissions.size());
+    EXPECT_EQ("ZARI_DavoDuvuri_Z1", rgSubmissions[0].strProfileName);
+    EXPECT_EQ("null 0 null", rgSubmissions[0].strTarget);
+    EXPECT_EQ("null", rgSubmissions[0].strGuid);
+    const DWORD rgdwSettings[8] = {0xFFFFFFFF, 1, 1, 0, 1, 1, 4096, 500};
     std::vector<BYTE> rgbExpected(120, 0);
-    const wchar_t wszName[] = L"ZARI_DavoDuvuri_Z1";
-    for (size_t i = 0; wszName[i] != L'\0'; i++)
+    const char szName[] = "ZARI_DavoDuvuri_Z1";
+    for (size_t i = 0; szName[i] != '\0'; i++)
     {
-        rgbExpected[2 * i] = static_cast<BYTE>(wszName[i]);
+        rgbExpected[2 * i] = static_cast<BYTE>(szName[i]);
     }
-    for (int i = 0; i < 8; i++)
-    {
-        memcpy(&rgbExpected[64 + 4 * i], &rgdwSettings[i], 4);
-    }
-    const BYTE rgbSignature[8] = {'C', 'S', 'P', 'R', 'O', 'F', 1, 0};
-    memcpy(&rgbExpected[96], rgbSignature, sizeof(rgbSignature));
-    EXPECT_EQ(rgbExpected, submission.rgbProfile);
-
-    std::string strLength = std::to_string(submission.strData.size());
-    EXPECT_EQ((std::vector<std::string>{
-                  "CrowdsourcingProfile_t()",
-                  "CrowdsourcingDataSubmitter_t(profile, null 0 null)",
-                  "Init() = 0x0",
-                  "SubmitData(" + strLength + " bytes, null) = 0x0",
-                  "~CrowdsourcingDataSubmitter_t()",
-                  "~CrowdsourcingProfile_t()",
-              }),
-              JournalCalls());
-}
-
-TEST_F(TraceSinksTest, FailuresOfTheLibraryAreTracedWithItsCode)
-{
-    struct Row
-    {
-        const char *szCase;
-        DWORD dwInit;
-        DWORD dwSubmit;
-        size_t cInitFailures;
-        size_t cSubmitFailures;
-        size_t cSubmitCalls;
-    };
-    const Row rgRows[] = {
-        {"Init fails", 0x1234, 0, 1, 0, 0},
-        {"SubmitData fails", 0, ERROR_NOT_ENOUGH_MEMORY, 0, 1, 1},
-        {"both would fail", 0x5, 0x6, 1, 0, 0},
-    };
-    for (const Row &row : rgRows)
-    {
-        SCOPED_TRACE(row.szCase);
-        ResetDeliveryState();
-        SetDword(c_wszPreferenceKey, c_wszPreferenceValue, 3);
-        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionInitResult, row.dwInit));
-        ASSERT_TRUE(SubmissionSetResult(c_wszSubmissionSubmitResult, row.dwSubmit));
-        TraceSession session;
-        FlushOneLog();
-        EXPECT_EQ(row.cInitFailures, session.CountFailures("Vantor Init()"));
-        EXPECT_EQ(row.cSubmitFailures, session.CountFailures("Vantor SubmitData()"));
-        std::vector<std::string> rgLines = session.Lines();
-        std::string strExpected = row.dwInit != 0
-                                      ? "1002|Vantor Init()|" + std::to_string(row.dwInit)
-                                      : "1002|Vantor SubmitData()|" + std::to_string(row.dwSubmit);
-        EXPECT_NE(rgLines.end(), std::find(rgLines.begin(), rgLines.end(), strExpected));
-        EXPECT_TRUE(SubmissionList().empty());
-        std::vector<std::string> rgCalls = JournalCalls();
-        size_t cSubmitCalls = 0;
-        for (const std::string &strCall : rgCalls)
-        {
-            cSubmitCalls += strCall.rfind("SubmitData(", 0) == 0 ? 1 : 0;
-        }
-        EXPECT_EQ(row.cSubmitCalls, cSubmitCalls);
-        // The submitter and the profile are destroyed on every path, in that order.
-        ASSERT_GE(rgCalls.size(), 2u);
-        EXPECT_EQ("~CrowdsourcingDataSubmitter_t()", rgCalls[rgCalls.size() - 2]);
-        EXPECT_EQ("~CrowdsourcingProfile_t()", rgCalls.back());
-    }
+    memcpy(&rgbExpected[64], rgdwSettings, sizeof(rgdwSettings));
+    memcpy(&rgbExpected[96], "CSPROF\1", 8);
+    EXPECT_EQ(rgbExpected, rgSubmissions[0].rgbProfile);
 }
 
 namespace
@@ -368,7 +301,7 @@ int s_cWrites = 0;
 BOOL WINAPI SeamWriteFile(HANDLE hFile, LPCVOID pvData, DWORD cbData, LPDWORD pcbWritten,
                           LPOVERLAPPED pOverlapped)
 {
-    s_rgFolderDuringWrites.push_back(TraceFileNames());
+    s_rgFolderDuringWrites.push_back(FileNames(c_wszTraceFolder));
     *pcbWritten = 0;
     if (++s_cWrites == s_iFailingWrite)
     {
@@ -383,12 +316,13 @@ BOOL WINAPI SeamWriteFile(HANDLE hFile, LPCVOID pvData, DWORD cbData, LPDWORD pc
     return WriteFile(hFile, pvData, cb, pcbWritten, pOverlapped);
 }
 
-class TraceFileWriteTest : public TraceSinksTest
+// Delivery to file and submission through the write seam, on the test thread.
+class TraceFileWriteTest : public CDeliveryTest
 {
 protected:
     void SetUp() override
     {
-        TraceSinksTest::SetUp();
+        CDeliveryTest::SetUp();
         s_rgFolderDuringWrites.clear();
         s_cbWriteLimit = 100;
         s_iFailingWrite = 0;
@@ -400,14 +334,9 @@ protected:
     void TearDown() override
     {
         TraceSinks::SetWriteFileForTest(nullptr);
-        TraceSinksTest::TearDown();
+        CDeliveryTest::TearDown();
     }
 };
-
-bool IsTemporaryName(const std::wstring &wstrName)
-{
-    return wstrName.size() == 36 + 4 && wstrName.compare(36, 4, L".tmp") == 0;
-}
 } // namespace
 
 TEST_F(TraceFileWriteTest, AReaderSeesOnlyTheTemporaryNameUntilTheFileIsComplete)
@@ -418,17 +347,17 @@ TEST_F(TraceFileWriteTest, AReaderSeesOnlyTheTemporaryNameUntilTheFileIsComplete
     size_t cbText = rgSubmissions[0].strData.size();
     // Short writes: the sink goes on until every byte is written.
     EXPECT_EQ(static_cast<int>((cbText + 99) / 100), s_cWrites);
-    for (const std::vector<std::wstring> &rgNames : s_rgFolderDuringWrites)
-    {
-        ASSERT_EQ(1u, rgNames.size());
-        EXPECT_TRUE(IsTemporaryName(rgNames[0])) << testing::PrintToString(rgNames[0]);
-    }
-    std::vector<std::wstring> rgNames = TraceFileNames();
+    std::vector<std::wstring> rgNames = FileNames(c_wszTraceFolder);
     ASSERT_EQ(1u, rgNames.size());
-    EXPECT_EQ(36u, rgNames[0].size());
-    EXPECT_EQ(rgNames[0] + L".tmp", s_rgFolderDuringWrites[0][0]);
+    for (const std::vector<std::wstring> &rgDuring : s_rgFolderDuringWrites)
+    {
+        EXPECT_EQ(std::vector<std::wstring>{rgNames[0] + L".tmp"}, rgDuring);
+    }
+    // The final name is a lower-case GUID, no braces, no extension; the file holds the text
+    // and nothing else.
+    EXPECT_EQ(Narrow(rgNames[0]), GuidText(ParseGuid(Narrow(rgNames[0]).c_str())));
     EXPECT_EQ(rgSubmissions[0].strData,
-              ReadFileText(std::wstring(TraceSinks::c_wszTraceDirectory) + L"\\" + rgNames[0]));
+              ReadFileText(std::wstring(c_wszTraceFolder) + L"\\" + rgNames[0]));
 }
 
 TEST_F(TraceFileWriteTest, AFailedWriteLeavesNoFileAndTheSubmissionStillHappens)
@@ -452,7 +381,7 @@ TEST_F(TraceFileWriteTest, AFailedWriteLeavesNoFileAndTheSubmissionStillHappens)
         s_iFailingWrite = row.iFailingWrite;
         s_fNoProgress = row.fNoProgress;
         FlushOneLog();
-        EXPECT_TRUE(TraceFileNames().empty());
+        EXPECT_TRUE(FileNames(c_wszTraceFolder).empty());
         EXPECT_EQ(row.fNoProgress ? 1 : row.iFailingWrite, s_cWrites);
         EXPECT_EQ(1u, SubmissionList().size());
     }

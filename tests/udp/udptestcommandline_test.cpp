@@ -70,55 +70,33 @@ TEST(UdpTestConfig, ResetAndInitialValues)
     UdpTestConfig config; // as the launcher is built: mains power, one test a day
     EXPECT_TRUE(config.acOnly);
     EXPECT_EQ(1.0f, config.maxTestDay);
-    config.enabled = true;
-    config.relayFqdn = "x";
-    config.localIp = "1.2.3.4";
-    config.expiration = 5;
+    // Every field changed, then reset: the command line shows nothing but the defaults.
+    config = {true, true, 5.0f, 6, 7, "1.2.3.4", 8, "relay", "::1", 9, 10, 11, 13, true};
     ResetUdpConfig(&config);
-    EXPECT_FALSE(config.enabled);
-    EXPECT_FALSE(config.acOnly);
+    std::string strLine;
+    EXPECT_EQ(" 0", BuildTestCommandLine(config, strLine));
+    EXPECT_FALSE(config.enabled || config.acOnly);
     EXPECT_EQ(0.0f, config.maxTestDay);
-    EXPECT_EQ(0u, config.expiration);
-    EXPECT_EQ(0u, config.lastTest);
-    EXPECT_TRUE(config.localIp.empty());
-    EXPECT_TRUE(config.relayFqdn.empty());
-    EXPECT_EQ(20u, config.delay);
-    EXPECT_EQ(500u, config.numPackets);
-    EXPECT_EQ(12u, config.packetSize);
+    EXPECT_EQ(0u, config.expiration + config.lastTest);
 }
 
 TEST(UdpRelayName, Rules)
 {
-    struct
+    // "null": a real host could be called so; the launcher refuses it separately.
+    for (const char *szName : {"relay.example.net", "10.0.0.1", "fe80::1", "my-relay", "null"})
     {
-        const char *szName;
-        bool fValid;
-    } rgCases[] = {
-        {"relay.example.net", true},
-        {"10.0.0.1", true},
-        {"fe80::1", true},
-        {"my-relay", true},
-        {"null", true}, // a real host could be called so; the launcher refuses it separately
-        {"", false},
-        {"-verbose", false},
-        {"relay net", false},
-        {"relay\"", false},
-        {"relay&calc", false},
-        {"[::1]", false},
-        {"relay_1", false},
-        {"r\xc3\xa9lay", false},
-    };
-    for (const auto &c : rgCases)
+        EXPECT_TRUE(UdpRelayNameIsValid(szName)) << szName;
+    }
+    for (const char *szName :
+         {"", "-verbose", "relay net", "relay\"", "relay&calc", "[::1]", "relay_1", "r\xc3\xa9lay"})
     {
-        SCOPED_TRACE(c.szName);
-        EXPECT_EQ(c.fValid, UdpRelayNameIsValid(c.szName));
+        EXPECT_FALSE(UdpRelayNameIsValid(szName)) << szName;
     }
     EXPECT_TRUE(UdpRelayNameIsValid(std::string(253, 'a')));
     EXPECT_FALSE(UdpRelayNameIsValid(std::string(254, 'a')));
-}
 
-TEST(UdpRelayName, NullAndEmptyAreNoRelay)
-{
+    // No relay: no name, or "null" (the reader's reading of a saved empty name), also when
+    // the address that replaces the name says so.
     UdpTestConfig config;
     EXPECT_FALSE(UdpConfigHasRelay(config));
     config.relayFqdn = "null";
@@ -126,7 +104,7 @@ TEST(UdpRelayName, NullAndEmptyAreNoRelay)
     config.relayFqdn = "relay";
     EXPECT_TRUE(UdpConfigHasRelay(config));
     config.remoteIp = "null";
-    EXPECT_FALSE(UdpConfigHasRelay(config)); // the address replaces the name
+    EXPECT_FALSE(UdpConfigHasRelay(config));
 }
 
 TEST(UdpTestSpacing, Table)

@@ -4,23 +4,24 @@
 #include "platform/wifi/wifiuser.h"
 #include "service/udptestlaunch.h"
 #include "service/udptestpolicy.h"
-#include "tests/common/testsupport.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/tracesession.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
-#include <functional>
 
-using udptest::TraceSession;
+using namespace testsupport;
 
 namespace
 {
+// Runs on the test thread and owns the prefix's policy file, test application and stand-in
+// state while it runs (the suite runs one test at a time).
 class UdpTestLaunch : public ::testing::Test
 {
 protected:
     void SetUp() override
     {
-        testsupport::PreparePolicyFolder();
-        testsupport::InstallTestApplication();
+        PreparePolicyFolder();
+        InstallTestApplication();
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
     }
     void TearDown() override
@@ -53,98 +54,124 @@ protected:
 };
 } // namespace
 
+// The gate against the Wi-Fi stand-in as telvanectl sets it (as the demo does), one row after
+// the other: a failure replaces the one before, "disconnected" clears it.
 TEST_F(UdpTestLaunch, WiFiGate)
 {
-    const char *const c_szRefused = "2001|We dont have active WiFi|0";
+    const std::string strRefused = "2001|We dont have active WiFi|0";
     struct
     {
-        const char *szName;
-        std::function<HRESULT()> set;
-        bool fActive;
-        const char *szAddress;
+        const wchar_t *wszCommand; // "platform wifi ..."; null: no state at all
+        const char *szAddress;     // what the gate fills in; empty: the gate refuses
         std::vector<std::string> rgstrTrace;
     } rgCases[] = {
-        {"connected", [] { return WiFiStandInSetConnected(L"10.1.2.3"); }, true, "10.1.2.3", {}},
-        {"a 16-character address",
-         [] { return WiFiStandInSetConnected(L"fe80::1234:5678a"); },
-         true,
-         "fe80::1234:5678a",
-         {}},
-        {"disconnected", [] { return WiFiStandInSetDisconnected(); }, false, "", {c_szRefused}},
-        {"OpenHandle fails",
-         [] { return WiFiStandInSetFailure(L"OpenHandle", c_hrWiFiStandInFailure); },
-         false,
+        {nullptr, "", {strRefused}},
+        {L"connected 10.1.2.3", "10.1.2.3", {}},
+        {L"connected fe80::1234:5678a", "fe80::1234:5678a", {}}, // 16 characters, no zero
+        {L"fail QueryAdapterInfo", "", {"2001|QueryAdapterInfo|80070015", strRefused}},
+        {L"fail QueryConnectionState 80004005",
          "",
-         {"2001|WiFiUserHandle::OpenHandle|80070015", c_szRefused}},
-        {"QueryConnectionState fails",
-         [] { return WiFiStandInSetFailure(L"QueryConnectionState", E_FAIL); },
-         false,
-         "",
-         {"2001|QueryConnectionState|80004005", c_szRefused}},
-        {"QueryAdapterInfo fails",
-         [] {
-             WiFiStandInSetConnected(L"10.1.2.3");
-             return WiFiStandInSetFailure(L"QueryAdapterInfo", c_hrWiFiStandInFailure);
-         },
-         false,
-         "",
-         {"2001|QueryAdapterInfo|80070015", c_szRefused}},
+         {"2001|QueryConnectionState|80004005", strRefused}},
+        {L"fail OpenHandle", "", {"2001|WiFiUserHandle::OpenHandle|80070015", strRefused}},
+        {L"disconnected", "", {strRefused}},
     };
+    HklmDeleteKey(WIFI_STANDIN_KEY);
     for (const auto &c : rgCases)
     {
-        SCOPED_TRACE(c.szName);
-        ASSERT_EQ(S_OK, c.set());
-        TraceSession session;
+        SCOPED_TRACE(Narrow(c.wszCommand != nullptr ? c.wszCommand : L"no state"));
+        if (c.wszCommand != nullptr)
+        {
+            ChildResult result = RunTelvanectl(std::wstring(L"platform wifi ") + c.wszCommand);
+            ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
+        }
+        CTraceSession session;
         UdpTestConfig config;
         ResetUdpConfig(&config);
-        EXPECT_EQ(c.fActive, UdpTestWiFiActive(&config));
+        EXPECT_EQ(*c.szAddress != '\0', UdpTestWiFiActive(&config));
         EXPECT_EQ(c.szAddress, config.localIp);
         EXPECT_EQ(c.rgstrTrace, session.Lines());
         EXPECT_EQ(0, WiFiStandInLiveHandles());
         EXPECT_EQ(0, WiFiStandInLiveNetworks());
     }
+    WiFiUserHandle *pHandle = nullptr;
+    EXPECT_EQ(E_INVALIDARG, WiFiUserHandle::OpenHandle(2, &pHandle)); // another version
+    EXPECT_EQ(nullptr, pHandle);
 }
 
 TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
 {
-    testsupport::CRelayProcess relay(47215);
+    CRelayProcess relay(47215);
     ASSERT_TRUE(relay.Listening());
     UdpTestConfig config = RelayConfig(47215);
-    TraceSession session;
+    CTraceSession session;
     uint64_t ullBefore = UdpConfigNow();
     HANDLE hProcess = INVALID_HANDLE_VALUE;
     EXPECT_EQ(S_OK, LaunchUdpTest(&config, &hProcess));
     uint64_t ullAfter = UdpConfigNow();
+    DWORD dwProcessId = GetProcessId(hProcess);
     WaitAndClose(hProcess);
 
     const std::string strCommandLine = "C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
                                        "127.0.0.1 -delay 1 -count 10 127.0.0.1 47215";
     EXPECT_EQ(std::vector<std::string>({"2008|" + strCommandLine, "2007"}), session.Lines());
+    // The chamber stand-in records what it started, and in which chamber.
+    std::wstring wstrSid, wstrInstance, wstrCommandLine;
+    DWORD dwType = 0, dwRecordedId = 0;
+    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberSid", &dwType, &wstrSid));
+    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberInstance", &dwType, &wstrInstance));
+    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastCommandLine", &dwType, &wstrCommandLine));
+    ASSERT_TRUE(HklmReadDword(CHAMBER_STANDIN_KEY, L"LastProcessId", &dwRecordedId));
+    EXPECT_EQ(0u, wstrSid.rfind(L"S-1-15-2-", 0));
+    EXPECT_STREQ(c_wszUdpTestChamberInstance, wstrInstance.c_str());
+    EXPECT_EQ(strCommandLine, Narrow(wstrCommandLine.c_str()));
+    EXPECT_EQ(dwProcessId, dwRecordedId);
     EXPECT_LE(ullBefore, config.lastTest);
     EXPECT_GE(ullAfter, config.lastTest);
-    std::string strSaved;
-    ASSERT_TRUE(udptest::ReadWholeFile(c_wszUdpConfigFile, &strSaved));
-    EXPECT_NE(std::string::npos, strSaved.find("\"LastTest\":" + std::to_string(config.lastTest)));
+    EXPECT_NE(
+        std::string::npos,
+        ReadFileText(c_wszUdpConfigFile).find("\"LastTest\":" + std::to_string(config.lastTest)));
     EXPECT_EQ("received 10 echoed 10 end idle\n", relay.WaitForReport());
-    EXPECT_EQ(1u, testsupport::ResultFiles().size());
+    EXPECT_EQ(1u, ResultFiles().size());
 }
 
-TEST_F(UdpTestLaunch, ChamberFailuresStartNothing)
+TEST_F(UdpTestLaunch, FailuresBeforeTheStartStartNothing)
 {
-    for (const wchar_t *wszCall : {L"GetChamberSidFromId", L"CreateProcessInChamber"})
+    const std::string strLine = "2008|C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
+                                "127.0.0.1 -delay 1 -count 10 127.0.0.1 47216";
+    struct
     {
-        SCOPED_TRACE(testsupport::Narrow(wszCall));
-        ASSERT_EQ(S_OK, ChamberStandInSetFailure(wszCall, CHAMBER_STANDIN_FAILURE));
+        const wchar_t *wszFailingCall; // of the chamber stand-in
+        bool fLongRelay;               // a valid name, but the line passes 255 characters
+        HRESULT hr;
+        size_t cchLine; // of the command line's trace ("2008|" and the line, cut at 255)
+        const char *szFailure;
+    } rgCases[] = {
+        {L"GetChamberSidFromId", false, CHAMBER_STANDIN_FAILURE, strLine.size(),
+         "2001|GetChamberSidFromId|80070005"},
+        {L"CreateProcessInChamber", false, CHAMBER_STANDIN_FAILURE, strLine.size(),
+         "2001|CreateProcessInChamber|80070005"},
+        {nullptr, true, static_cast<HRESULT>(0x8007007A), 5 + 255, "2001|StringCchPrintf|8007007a"},
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(c.szFailure);
+        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
+        if (c.wszFailingCall != nullptr)
+        {
+            ASSERT_EQ(S_OK, ChamberStandInSetFailure(c.wszFailingCall, CHAMBER_STANDIN_FAILURE));
+        }
         UdpTestConfig config = RelayConfig(47216);
-        TraceSession session;
+        config.relayFqdn = c.fLongRelay ? std::string(200, 'r') : config.relayFqdn;
+        CTraceSession session;
         HANDLE hProcess = nullptr;
-        EXPECT_EQ(CHAMBER_STANDIN_FAILURE, LaunchUdpTest(&config, &hProcess));
+        EXPECT_EQ(c.hr, LaunchUdpTest(&config, &hProcess));
         EXPECT_EQ(INVALID_HANDLE_VALUE, hProcess);
         EXPECT_EQ(0u, config.lastTest);
         std::vector<std::string> rgLines = session.Lines();
         ASSERT_EQ(2u, rgLines.size()); // the command line, the failure; nothing saved
-        EXPECT_EQ(0u, rgLines[0].rfind("2008|", 0));
-        EXPECT_EQ("2001|" + testsupport::Narrow(wszCall) + "|80070005", rgLines[1]);
+        EXPECT_EQ(0u, rgLines[0].rfind("2008|C:\\programs\\", 0));
+        EXPECT_EQ(c.cchLine, rgLines[0].size());
+        EXPECT_EQ(c.szFailure, rgLines[1]);
     }
     EXPECT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigFile));
 }
@@ -159,19 +186,4 @@ TEST_F(UdpTestLaunch, StartedTestIsHandedOutWhenTheSaveFails)
     EXPECT_TRUE(FAILED(hr));
     EXPECT_NE(0u, config.lastTest);
     WaitAndClose(hProcess); // tracked, so no second test could run beside it
-}
-
-TEST_F(UdpTestLaunch, CommandLineThatDoesNotFitIsRefused)
-{
-    UdpTestConfig config = RelayConfig(47218);
-    config.relayFqdn = std::string(200, 'r'); // a valid name, but the line passes 255
-    TraceSession session;
-    HANDLE hProcess = nullptr;
-    EXPECT_EQ(static_cast<HRESULT>(0x8007007A), LaunchUdpTest(&config, &hProcess));
-    EXPECT_EQ(INVALID_HANDLE_VALUE, hProcess);
-    std::vector<std::string> rgLines = session.Lines();
-    ASSERT_EQ(2u, rgLines.size());
-    EXPECT_EQ(2u + 255u, rgLines[0].size() - 3); // "2008|" and the cut line of 255
-    EXPECT_EQ("2001|StringCchPrintf|8007007a", rgLines[1]);
-    EXPECT_EQ(0u, config.lastTest);
 }

@@ -1,74 +1,60 @@
 // The policy file in the prefix's real policy folder, and the refresh's failure paths.
 #include "platform/endpointdirectory/endpointdirectory.h"
 #include "service/udptestpolicy.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/tracesession.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
 
-using udptest::ReadWholeFile;
-using udptest::TraceSession;
-using udptest::WriteWholeFile;
+using namespace testsupport;
 
 namespace
 {
 const char c_szResetText[] = R"({"Enabled":false,"RelayFQDN":"","RelayPort":0,"Expiration":0,)"
                              R"("LastTest":0,"NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})";
 
+// Runs on the test thread and owns the prefix's policy file and endpoint role while it runs
+// (the suite runs one test at a time).
 class UdpTestPolicy : public ::testing::Test
 {
 protected:
-    void SetUp() override { testsupport::PreparePolicyFolder(); }
+    void SetUp() override { PreparePolicyFolder(); }
     void TearDown() override
     {
         RemoveDirectoryW(c_wszUdpConfigTempFile);
         DeleteFileW(c_wszUdpConfigFile);
-        RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
-    }
-
-    static std::string PolicyText()
-    {
-        std::string strText;
-        EXPECT_TRUE(ReadWholeFile(c_wszUdpConfigFile, &strText));
-        return strText;
-    }
-
-    static void SetRole(const wchar_t *wszUrl)
-    {
-        ASSERT_EQ(ERROR_SUCCESS,
-                  RegSetKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                                  REG_SZ, wszUrl,
-                                  static_cast<DWORD>((wcslen(wszUrl) + 1) * sizeof(wchar_t))));
-    }
-
-    // A failed refresh of a reset record: saved, due again in seven days.
-    static void ExpectRetryInAWeek(uint64_t ullBefore, const UdpTestConfig &config)
-    {
-        uint64_t ullAfter = UdpConfigNow();
-        EXPECT_LE(ullBefore + c_ullUdpConfigRetryTicks, config.expiration);
-        EXPECT_GE(ullAfter + c_ullUdpConfigRetryTicks, config.expiration);
-        std::string strExpected = c_szResetText;
-        strExpected.replace(strExpected.find("\"Expiration\":0"), 14,
-                            "\"Expiration\":" + std::to_string(config.expiration));
-        EXPECT_EQ(strExpected, PolicyText());
+        HklmDeleteValue(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     }
 };
 } // namespace
 
-TEST_F(UdpTestPolicy, SavedTextAfterReset)
+TEST_F(UdpTestPolicy, SaveAndLoadRoundTripThroughTheFile)
 {
-    TraceSession session;
+    CTraceSession session;
     UdpTestConfig config;
     config.enabled = true;
     ResetUdpConfig(&config);
     ASSERT_EQ(S_OK, SaveUdpConfig(&config));
-    EXPECT_EQ(c_szResetText, PolicyText());
+    EXPECT_EQ(c_szResetText, ReadFileText(c_wszUdpConfigFile));
     EXPECT_EQ(std::vector<std::string>({"2007"}), session.Lines());
     // Written under the temporary name, which is gone once it replaced the policy.
     EXPECT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigTempFile));
-}
 
-TEST_F(UdpTestPolicy, RoundTripThroughTheFile)
-{
+    // The saved empty relay reads back as the text null, which names no relay, also once
+    // saved again.
+    session.Clear();
+    UdpTestConfig loaded;
+    ASSERT_EQ(S_OK, LoadUdpConfig(&loaded));
+    EXPECT_EQ(std::vector<std::string>({"2006"}), session.Lines());
+    EXPECT_FALSE(loaded.acOnly); // "BattAC"
+    EXPECT_EQ("null", loaded.relayFqdn);
+    EXPECT_FALSE(UdpConfigHasRelay(loaded));
+    ASSERT_EQ(S_OK, SaveUdpConfig(&loaded));
+    ASSERT_EQ(S_OK, LoadUdpConfig(&loaded));
+    EXPECT_FALSE(UdpConfigHasRelay(loaded));
+
+    // Every field the file keeps differs from the reset record loaded into, so one that is
+    // not read back shows when the loaded record is saved again.
     UdpTestConfig saved;
     ResetUdpConfig(&saved);
     saved.enabled = true;
@@ -81,96 +67,61 @@ TEST_F(UdpTestPolicy, RoundTripThroughTheFile)
     saved.numPackets = 100;
     saved.localIp = "10.0.0.7"; // not kept in the file
     ASSERT_EQ(S_OK, SaveUdpConfig(&saved));
+    const std::string strSaved = ReadFileText(c_wszUdpConfigFile);
     EXPECT_EQ(R"({"Enabled":true,"RelayFQDN":"relay.example.net","RelayPort":47211,)"
               R"("Expiration":134000000000000000,"LastTest":133999999999999999,)"
               R"("NumPackets":100,"MaxTestDay":2.5,"Policy":"ACOnly"})",
-              PolicyText());
-
-    TraceSession session;
-    UdpTestConfig loaded;
+              strSaved);
     ResetUdpConfig(&loaded);
     ASSERT_EQ(S_OK, LoadUdpConfig(&loaded));
-    EXPECT_EQ(std::vector<std::string>({"2006"}), session.Lines());
-    EXPECT_TRUE(loaded.enabled);
-    EXPECT_TRUE(loaded.acOnly);
-    EXPECT_EQ(2.5f, loaded.maxTestDay);
-    EXPECT_EQ(saved.expiration, loaded.expiration);
-    EXPECT_EQ(saved.lastTest, loaded.lastTest);
-    EXPECT_EQ(saved.relayFqdn, loaded.relayFqdn);
-    EXPECT_EQ(47211u, loaded.relayPort);
-    EXPECT_EQ(100u, loaded.numPackets);
     EXPECT_TRUE(loaded.localIp.empty());
-
-    ResetUdpConfig(&saved);
-    ASSERT_EQ(S_OK, SaveUdpConfig(&saved));
-    ASSERT_EQ(S_OK, LoadUdpConfig(&loaded));
-    EXPECT_FALSE(loaded.acOnly); // "BattAC" reads back
-}
-
-TEST_F(UdpTestPolicy, SavedEmptyRelayReadsBackAsNoRelay)
-{
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    config.enabled = true;
-    ASSERT_EQ(S_OK, SaveUdpConfig(&config));
-    UdpTestConfig loaded;
-    ASSERT_EQ(S_OK, LoadUdpConfig(&loaded));
-    EXPECT_EQ("null", loaded.relayFqdn); // the reader's reading of ""
-    EXPECT_FALSE(UdpConfigHasRelay(loaded));
-    // Saved again, it stays the text null and still names no relay.
     ASSERT_EQ(S_OK, SaveUdpConfig(&loaded));
-    ASSERT_EQ(S_OK, LoadUdpConfig(&loaded));
-    EXPECT_FALSE(UdpConfigHasRelay(loaded));
+    EXPECT_EQ(strSaved, ReadFileText(c_wszUdpConfigFile));
 }
 
-TEST_F(UdpTestPolicy, LoadFailures)
+TEST_F(UdpTestPolicy, LoadReadsTheWholeFileOrFails)
 {
+    const std::string strBadFormat = "2001|JsonReader::FromJsonString|b";
     struct
     {
-        const char *szText; // null: no file
+        const char *szCase;
+        std::string strText; // "-": no file
         HRESULT hr;
-        const char *szTrace;
+        std::string strTrace; // the failure after the read mark, if any
     } rgCases[] = {
-        {nullptr, HRESULT_FROM_WIN32(ERROR_FILE_NOT_FOUND), "2001|CreateFile (read)|80070002"},
-        {"", HRESULT_FROM_WIN32(ERROR_BAD_FORMAT), "2001|JsonReader::FromJsonString|b"},
-        {"[1,2]", HRESULT_FROM_WIN32(ERROR_BAD_FORMAT), "2001|JsonReader::FromJsonString|b"},
-        {"\"text\"", HRESULT_FROM_WIN32(ERROR_BAD_FORMAT), "2001|JsonReader::FromJsonString|b"},
-        {"  \r\n{\"Enabled\":true}", E_INVALIDARG, nullptr}, // no expiration
-        {"{\"RelayFQDN\":\"a b\",\"Expiration\":1}", E_INVALIDARG, "2001|RelayFQDN|80070057"},
+        {"no file", "-", HRESULT_FROM_WIN32(ERROR_FILE_NOT_FOUND),
+         "2001|CreateFile (read)|80070002"},
+        {"empty", "", HRESULT_FROM_WIN32(ERROR_BAD_FORMAT), strBadFormat},
+        {"array", "[1,2]", HRESULT_FROM_WIN32(ERROR_BAD_FORMAT), strBadFormat},
+        {"string", "\"text\"", HRESULT_FROM_WIN32(ERROR_BAD_FORMAT), strBadFormat},
+        {"no expiration", "  \r\n{\"Enabled\":true}", E_INVALIDARG, ""},
+        {"bad relay", "{\"RelayFQDN\":\"a b\",\"Expiration\":1}", E_INVALIDARG,
+         "2001|RelayFQDN|80070057"},
+        // Past one 512-byte block: the members after the padding still count.
+        {"long file",
+         "{\"Pad\":\"" + std::string(1500, 'x') + "\",\"Enabled\":true,\"Expiration\":42}", S_OK,
+         ""},
     };
     for (const auto &c : rgCases)
     {
-        SCOPED_TRACE(c.szText != nullptr ? c.szText : "(no file)");
+        SCOPED_TRACE(c.szCase);
         DeleteFileW(c_wszUdpConfigFile);
-        if (c.szText != nullptr)
+        if (c.strText != "-")
         {
-            ASSERT_TRUE(WriteWholeFile(c_wszUdpConfigFile, c.szText));
+            ASSERT_TRUE(WriteFileText(c_wszUdpConfigFile, c.strText));
         }
-        TraceSession session;
+        CTraceSession session;
         UdpTestConfig config;
         ResetUdpConfig(&config);
         EXPECT_EQ(c.hr, LoadUdpConfig(&config));
         std::vector<std::string> rgExpected = {"2006"};
-        if (c.szTrace != nullptr)
+        if (!c.strTrace.empty())
         {
-            rgExpected.push_back(c.szTrace);
+            rgExpected.push_back(c.strTrace);
         }
         EXPECT_EQ(rgExpected, session.Lines());
+        EXPECT_EQ(c.hr == S_OK ? 42u : 0u, config.expiration);
     }
-}
-
-TEST_F(UdpTestPolicy, LongFileIsReadWhole)
-{
-    // Past one 512-byte block: the members after the padding still count.
-    std::string strText = "{\"Pad\":\"" + std::string(1500, 'x') +
-                          "\",\"Enabled\":true,\"Expiration\":42,\"LastTest\":7}";
-    ASSERT_TRUE(WriteWholeFile(c_wszUdpConfigFile, strText));
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    ASSERT_EQ(S_OK, LoadUdpConfig(&config));
-    EXPECT_TRUE(config.enabled);
-    EXPECT_EQ(42u, config.expiration);
-    EXPECT_EQ(7u, config.lastTest);
 }
 
 TEST_F(UdpTestPolicy, FailedSaveKeepsTheOldPolicy)
@@ -179,15 +130,14 @@ TEST_F(UdpTestPolicy, FailedSaveKeepsTheOldPolicy)
     ResetUdpConfig(&config);
     config.lastTest = 123;
     ASSERT_EQ(S_OK, SaveUdpConfig(&config));
-    std::string strOld = PolicyText();
+    std::string strOld = ReadFileText(c_wszUdpConfigFile);
 
     // Nothing can be created under the temporary name while a folder holds it.
     ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr));
-    TraceSession session;
+    CTraceSession session;
     config.lastTest = 456;
-    HRESULT hr = SaveUdpConfig(&config);
-    EXPECT_TRUE(FAILED(hr));
-    EXPECT_EQ(strOld, PolicyText());
+    EXPECT_TRUE(FAILED(SaveUdpConfig(&config)));
+    EXPECT_EQ(strOld, ReadFileText(c_wszUdpConfigFile));
     std::vector<std::string> rgLines = session.Lines();
     ASSERT_EQ(2u, rgLines.size());
     EXPECT_EQ("2007", rgLines[0]);
@@ -195,33 +145,43 @@ TEST_F(UdpTestPolicy, FailedSaveKeepsTheOldPolicy)
     EXPECT_EQ(456u, config.lastTest); // the record in memory is the caller's
 }
 
-TEST_F(UdpTestPolicy, RefreshWithoutEndpointRetriesInAWeekAndSaves)
+TEST_F(UdpTestPolicy, FailedRefreshRetriesInAWeekAndSaves)
 {
-    TraceSession session;
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    uint64_t ullBefore = UdpConfigNow();
-    RefreshUdpConfig(&config);
-    ExpectRetryInAWeek(ullBefore, config);
-    EXPECT_EQ(std::vector<std::string>({"2005", "2001|GetServiceEndpoint|80070002", "2007"}),
-              session.Lines());
-    EXPECT_FALSE(IsConfigExpired(&config));
-}
-
-TEST_F(UdpTestPolicy, RefreshAgainstNoServiceRetriesInAWeekAndSaves)
-{
-    SetRole(L"https://localhost:47219/"); // nothing listens there
-    TraceSession session;
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    uint64_t ullBefore = UdpConfigNow();
-    RefreshUdpConfig(&config);
-    ExpectRetryInAWeek(ullBefore, config);
-    std::vector<std::string> rgLines = session.Lines();
-    ASSERT_EQ(3u, rgLines.size());
-    EXPECT_EQ("2005", rgLines[0]);
-    EXPECT_EQ(0u, rgLines[1].rfind("2001|OrvexJsonSendRequest|", 0)) << rgLines[1];
-    EXPECT_EQ("2007", rgLines[2]);
+    struct
+    {
+        const wchar_t *wszRole; // the policy service's address; null: none
+        const char *szFailure;  // how the failure line starts
+    } rgCases[] = {
+        {nullptr, "2001|GetServiceEndpoint|80070002"},
+        {L"https://localhost:47219/", "2001|OrvexJsonSendRequest|"}, // nothing listens there
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(c.szFailure);
+        if (c.wszRole != nullptr)
+        {
+            HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole, c.wszRole);
+        }
+        CTraceSession session;
+        UdpTestConfig config;
+        ResetUdpConfig(&config);
+        uint64_t ullBefore = UdpConfigNow();
+        RefreshUdpConfig(&config);
+        uint64_t ullAfter = UdpConfigNow();
+        EXPECT_LE(ullBefore + c_ullUdpConfigRetryTicks, config.expiration);
+        EXPECT_GE(ullAfter + c_ullUdpConfigRetryTicks, config.expiration);
+        EXPECT_FALSE(IsConfigExpired(&config));
+        // The reset record is saved with the new expiration.
+        std::string strExpected = c_szResetText;
+        strExpected.replace(strExpected.find("\"Expiration\":0"), 14,
+                            "\"Expiration\":" + std::to_string(config.expiration));
+        EXPECT_EQ(strExpected, ReadFileText(c_wszUdpConfigFile));
+        std::vector<std::string> rgLines = session.Lines();
+        ASSERT_EQ(3u, rgLines.size());
+        EXPECT_EQ("2005", rgLines[0]);
+        EXPECT_EQ(0u, rgLines[1].rfind(c.szFailure, 0)) << rgLines[1];
+        EXPECT_EQ("2007", rgLines[2]);
+    }
 }
 
 TEST(UdpTestPolicyTime, IsConfigExpired)

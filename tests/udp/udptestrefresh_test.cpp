@@ -3,86 +3,57 @@
 #include "platform/endpointdirectory/endpointdirectory.h"
 #include "service/udptestpolicy.h"
 #include "tests/common/policyserver.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/tracesession.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
 
+using namespace testsupport;
+
 namespace
 {
-enum class Outcome
-{
-    Applied,     // expiration from the answer
-    RetryInWeek, // a failed refresh
-};
-
 struct RefreshCase
 {
     const char *szName;
-    USHORT usPort; // one each: a later request may reuse an earlier connection
     int iStatus;
     unsigned cChunks; // 0: one body with its length
     const char *szBody;
-    Outcome outcome;
-    uint64_t ullLifetime;                   // Applied: now plus this
+    uint64_t ullLifetime;                   // expires now plus this; 0: a failed refresh
     std::vector<std::string> rgstrFailures; // the 2001 lines between 2005 and 2007
     const char *szSaved;                    // the saved text, "Expiration" left out
 };
 
 const uint64_t c_ullDay = 864000000000ull;
 
+// clang-format off
 const RefreshCase c_rgRefreshCases[] = {
-    {"a policy with a lifetime",
-     47220,
-     200,
-     0,
+    {"a policy with a lifetime", 200, 0,
      R"({"Enabled":"true","RelayFQDN":"127.0.0.1","RelayPort":47250,"NumPackets":100,)"
      R"("MaxTestDay":2,"DurationValid":"P1D","Policy":"BattAC"})",
-     Outcome::Applied,
-     c_ullDay,
-     {},
+     c_ullDay, {},
      R"({"Enabled":true,"RelayFQDN":"127.0.0.1","RelayPort":47250,"LastTest":0,)"
      R"("NumPackets":100,"MaxTestDay":2,"Policy":"BattAC"})"},
-    {"chunked, mains power only",
-     47221,
-     200,
-     3,
+    {"chunked, mains power only", 200, 3,
      R"({"Enabled":true,"RelayFQDN":"relay.example.net","RelayPort":7,"DurationValid":"PT30M"})",
-     Outcome::Applied,
-     18000000000ull,
-     {},
+     18000000000ull, {},
      R"({"Enabled":true,"RelayFQDN":"relay.example.net","RelayPort":7,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"ACOnly"})"},
-    {"an answer without expiration",
-     47222,
-     200,
-     0,
+    {"an answer without expiration", 200, 0,
      R"({"Enabled":true,"RelayFQDN":"r","RelayPort":9,"Policy":"ACOnly"})",
-     Outcome::RetryInWeek,
-     0,
-     {"2001|ParseJson|80070057"},
+     0, {"2001|ParseJson|80070057"},
      R"({"Enabled":true,"RelayFQDN":"r","RelayPort":9,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})"},
-    {"a relay name for a shell",
-     47223,
-     200,
-     0,
+    {"a relay name for a shell", 200, 0,
      R"({"Enabled":true,"RelayFQDN":"r & calc.exe","RelayPort":9,"DurationValid":"P1D"})",
-     Outcome::RetryInWeek,
-     0,
-     {"2001|RelayFQDN|80070057", "2001|ParseJson|80070057"},
+     0, {"2001|RelayFQDN|80070057", "2001|ParseJson|80070057"},
      R"({"Enabled":true,"RelayFQDN":"","RelayPort":0,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})"},
-    {"not found",
-     47224,
-     404,
-     0,
-     "",
-     Outcome::RetryInWeek,
-     0,
-     {"2001|OrvexJsonSendRequest|80070490"},
+    {"not found", 404, 0, "",
+     0, {"2001|OrvexJsonSendRequest|80070490"},
      R"({"Enabled":false,"RelayFQDN":"","RelayPort":0,"LastTest":0,)"
      R"("NumPackets":500,"MaxTestDay":0,"Policy":"BattAC"})"},
 };
+// clang-format on
 
 // The saved text without its "Expiration" member, which depends on the clock.
 std::string WithoutExpiration(const std::string &strText, uint64_t *pullExpiration)
@@ -97,48 +68,43 @@ std::string WithoutExpiration(const std::string &strText, uint64_t *pullExpirati
     return strText.substr(0, pos) + strText.substr(end);
 }
 
+// Runs on the test thread and owns the prefix's policy file and endpoint role while it runs.
 class UdpTestRefresh : public ::testing::Test
 {
 protected:
-    void SetUp() override { testsupport::PreparePolicyFolder(); }
+    void SetUp() override { PreparePolicyFolder(); }
     void TearDown() override
     {
         DeleteFileW(c_wszUdpConfigFile);
-        RegDeleteKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
+        HklmDeleteValue(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     }
 };
-} // namespace
 
-static void RefreshAgainst(const RefreshCase &c)
+void RefreshAgainst(const RefreshCase &c, USHORT usPort)
 {
     PolicyServerOptions options;
-    options.usPort = c.usPort;
+    options.usPort = usPort;
     options.iStatus = c.iStatus;
     options.strBody = c.szBody;
     options.fUseBody = true;
     options.cChunks = c.cChunks;
     CTestPolicyServer server;
     ASSERT_TRUE(server.Start(options));
-    std::wstring wstrEndpoint = L"https://localhost:" + std::to_wstring(c.usPort) + L"/";
-    ASSERT_EQ(ERROR_SUCCESS,
-              RegSetKeyValueW(HKEY_LOCAL_MACHINE, ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                              REG_SZ, wstrEndpoint.c_str(),
-                              static_cast<DWORD>((wstrEndpoint.size() + 1) * sizeof(wchar_t))));
+    HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
+                  L"https://localhost:" + std::to_wstring(usPort) + L"/");
 
-    udptest::TraceSession session;
+    CTraceSession session;
     UdpTestConfig config;
     ResetUdpConfig(&config);
     uint64_t ullBefore = UdpConfigNow();
     RefreshUdpConfig(&config);
     uint64_t ullAfter = UdpConfigNow();
 
-    uint64_t ullLifetime = c.outcome == Outcome::Applied ? c.ullLifetime : c_ullUdpConfigRetryTicks;
+    uint64_t ullLifetime = c.ullLifetime != 0 ? c.ullLifetime : c_ullUdpConfigRetryTicks;
     EXPECT_LE(ullBefore + ullLifetime, config.expiration);
     EXPECT_GE(ullAfter + ullLifetime, config.expiration);
-    std::string strSaved;
-    ASSERT_TRUE(udptest::ReadWholeFile(c_wszUdpConfigFile, &strSaved));
     uint64_t ullSavedExpiration = 0;
-    EXPECT_EQ(c.szSaved, WithoutExpiration(strSaved, &ullSavedExpiration));
+    EXPECT_EQ(c.szSaved, WithoutExpiration(ReadFileText(c_wszUdpConfigFile), &ullSavedExpiration));
     EXPECT_EQ(config.expiration, ullSavedExpiration);
 
     std::vector<std::string> rgExpected = {"2005"};
@@ -151,13 +117,16 @@ static void RefreshAgainst(const RefreshCase &c)
     ASSERT_EQ(1u, rgRequests.size());
     EXPECT_NE(std::string::npos, rgRequests[0].find("/v1/api/config/udpecho")) << rgRequests[0];
 }
+} // namespace
 
 TEST_F(UdpTestRefresh, AppliesAndSavesTheAnswer)
 {
+    // A port each: a later request may reuse an earlier connection.
+    USHORT usPort = 47220;
     for (const RefreshCase &c : c_rgRefreshCases)
     {
         SCOPED_TRACE(c.szName);
-        RefreshAgainst(c);
+        RefreshAgainst(c, usPort++);
         DeleteFileW(c_wszUdpConfigFile);
     }
 }

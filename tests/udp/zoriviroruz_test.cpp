@@ -1,173 +1,85 @@
-// The test application, installed in the prefix and started through the chamber stand-in
-// the way the service starts it, against the loopback relay.
+// The test application, installed in the prefix as the service finds it, run against the
+// loopback relay. (The launch through the chamber stand-in is UdpTestLaunch's.)
 #include "lib/jsonreader.h"
-#include "platform/securityruntime/securityruntime.h"
-#include "service/udptestcommandline.h"
 #include "tests/common/testsupport.h"
-#include "tests/udp/udptestsupport.h"
+#include "tests/common/udpsupport.h"
 
 #include <gtest/gtest.h>
 #include <algorithm>
 #include <memory>
-#include <sddl.h>
 
-using testsupport::CRelayProcess;
+using namespace testsupport;
 
 namespace
 {
-const wchar_t c_wszChamberId[] = L"ZoRiVirOruz";
-const wchar_t c_wszChamberInstance[] = L"{5B04B775-356B-4AA0-AAF8-6491FFEA562E}";
-
-std::wstring ReadChamberString(const wchar_t *wszName)
-{
-    wchar_t wsz[1024] = L"";
-    DWORD cb = sizeof(wsz);
-    RegGetValueW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY, wszName, RRF_RT_REG_SZ, nullptr, wsz,
-                 &cb);
-    return wsz;
-}
-
-DWORD ReadChamberDword(const wchar_t *wszName)
-{
-    DWORD dw = 0;
-    DWORD cb = sizeof(dw);
-    RegGetValueW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY, wszName, RRF_RT_REG_DWORD, nullptr, &dw,
-                 &cb);
-    return dw;
-}
-
-std::wstring SidText(PSID pSid)
-{
-    PWSTR pwsz = nullptr;
-    if (!ConvertSidToStringSidW(pSid, &pwsz))
-    {
-        return L"";
-    }
-    std::wstring wstr = pwsz;
-    LocalFree(pwsz);
-    return wstr;
-}
-
-// Starts the installed application in its chamber as the launcher does: the phone's 68-byte
-// startup block, "path arguments" in 256 characters, no console window.
-HRESULT StartInChamber(const std::string &strArguments, PROCESS_INFORMATION *ppi,
-                       std::wstring *pwstrSid, std::wstring *pwstrCommandLine)
-{
-    wchar_t wszCommandLine[256];
-    swprintf_s(wszCommandLine, L"%s %hs", testsupport::c_wszTestAppPath, strArguments.c_str());
-    *pwstrCommandLine = wszCommandLine;
-    PSID pSid = nullptr;
-    HRESULT hr = GetChamberSidFromId(c_wszChamberId, &pSid);
-    if (FAILED(hr))
-    {
-        return hr;
-    }
-    *pwstrSid = SidText(pSid);
-    BYTE rgbStartup[sizeof(STARTUPINFOW)] = {};
-    reinterpret_cast<STARTUPINFOW *>(rgbStartup)->cb = 68;
-    hr = CreateProcessInChamber(pSid, c_wszChamberInstance, nullptr, wszCommandLine, FALSE,
-                                0x08000000, nullptr, reinterpret_cast<STARTUPINFOW *>(rgbStartup),
-                                ppi);
-    LocalFree(pSid);
-    return hr;
-}
-
-struct RunSummary
-{
-    DWORD dwExitCode = 0;
-    std::string strResult; // the one result file's text
-    uint32_t ulSent = 0;
-    uint32_t ulReceived = 0;
-    uint32_t ulLost = 0;
-    std::string strError;
-};
-
-void RunAndCollect(const std::string &strArguments, RunSummary *pSummary)
-{
-    PROCESS_INFORMATION pi = {};
-    std::wstring wstrSid;
-    std::wstring wstrCommandLine;
-    ASSERT_EQ(S_OK, StartInChamber(strArguments, &pi, &wstrSid, &wstrCommandLine));
-    CloseHandle(pi.hThread);
-    DWORD dwWait = WaitForSingleObject(pi.hProcess, 90000);
-    GetExitCodeProcess(pi.hProcess, &pSummary->dwExitCode);
-    CloseHandle(pi.hProcess);
-    ASSERT_EQ(WAIT_OBJECT_0, dwWait);
-
-    // The chamber stand-in records what it started, and in which chamber.
-    EXPECT_EQ(wstrSid, ReadChamberString(L"LastChamberSid"));
-    EXPECT_EQ(0u, wstrSid.rfind(L"S-1-15-2-", 0));
-    EXPECT_EQ(c_wszChamberInstance, ReadChamberString(L"LastChamberInstance"));
-    EXPECT_EQ(wstrCommandLine, ReadChamberString(L"LastCommandLine"));
-    EXPECT_EQ(pi.dwProcessId, ReadChamberDword(L"LastProcessId"));
-
-    std::vector<std::wstring> rgFiles = testsupport::ResultFiles();
-    ASSERT_EQ(1u, rgFiles.size());
-    ASSERT_TRUE(udptest::ReadWholeFile(rgFiles[0], &pSummary->strResult));
-    std::unique_ptr<JsonValue> pRoot(JsonReader::FromJsonString(pSummary->strResult.c_str()));
-    ASSERT_EQ(JsonNodeType::Object, pRoot->Type());
-    const JsonObjectNode *pObject = static_cast<const JsonObjectNode *>(pRoot.get());
-    EXPECT_TRUE(pObject->GetMemberNumber("Sent", pSummary->ulSent));
-    EXPECT_TRUE(pObject->GetMemberNumber("Received", pSummary->ulReceived));
-    EXPECT_TRUE(pObject->GetMemberNumber("Lost", pSummary->ulLost));
-    pObject->GetMemberText("Error", pSummary->strError);
-}
-
+// Runs on the test thread and owns the installed test application and its results while it
+// runs (the suite runs one test at a time).
 class ZoRiVirOruz : public ::testing::Test
 {
 protected:
-    void SetUp() override
-    {
-        testsupport::InstallTestApplication();
-        RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
-    }
-    void TearDown() override { RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY); }
+    void SetUp() override { InstallTestApplication(); }
 };
+
+ChildResult RunTestApplication(const std::wstring &wstrArguments)
+{
+    return RunChild(std::wstring(c_wszTestAppPath) + L" " + wstrArguments, {}, 90000);
+}
 } // namespace
 
-TEST_F(ZoRiVirOruz, CountsEchoesFromTheRelay)
+TEST_F(ZoRiVirOruz, CountsWhatTheRelayEchoes)
 {
-    // The relay leaves every fourth packet unanswered, so the count shows what came back.
-    CRelayProcess relay(47211, L"-drop 4");
-    ASSERT_TRUE(relay.Listening());
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    config.localIp = "127.0.0.1";
-    config.relayFqdn = "127.0.0.1";
-    config.relayPort = 47211;
-    config.numPackets = 20;
-    config.delay = 1;
-    std::string strArguments;
-    BuildTestCommandLine(config, strArguments);
-    ASSERT_EQ("-localIP 127.0.0.1 -delay 1 -count 20 127.0.0.1 47211", strArguments);
-
-    RunSummary summary;
-    RunAndCollect(strArguments, &summary);
-    EXPECT_EQ(0u, summary.dwExitCode) << summary.strResult;
-    EXPECT_EQ(20u, summary.ulSent) << summary.strResult;
-    EXPECT_EQ(15u, summary.ulReceived) << summary.strResult;
-    EXPECT_EQ(5u, summary.ulLost) << summary.strResult;
-    EXPECT_EQ("null", summary.strError); // no error: "" reads back as the text null
-    EXPECT_EQ("received 20 echoed 15 end idle\n", relay.WaitForReport());
-}
-
-TEST_F(ZoRiVirOruz, NobodyListeningLosesEverything)
-{
-    RunSummary summary;
-    RunAndCollect("-remoteIP -delay 1 -count 3 -size 64 127.0.0.1 47212", &summary);
-    EXPECT_EQ(0u, summary.dwExitCode) << summary.strResult;
-    EXPECT_EQ(3u, summary.ulSent) << summary.strResult;
-    EXPECT_EQ(0u, summary.ulReceived);
-    EXPECT_NE(std::string::npos, summary.strResult.find("\"PacketSize\":64"));
-}
-
-TEST_F(ZoRiVirOruz, UnresolvableRelayIsReportedInTheResult)
-{
-    RunSummary summary;
-    RunAndCollect("-remoteIP -count 3 relay.invalid 47213", &summary);
-    EXPECT_EQ(1u, summary.dwExitCode);
-    EXPECT_EQ(0u, summary.ulSent);
-    EXPECT_EQ(0u, summary.strError.rfind("cannot resolve the relay", 0)) << summary.strError;
+    struct
+    {
+        const wchar_t *wszArguments;
+        USHORT usRelay;       // a relay listens on this port (0: none)
+        const char *szReport; // the relay's
+        DWORD dwExitCode;
+        uint32_t ulSent, ulReceived;
+        const char *szError;  // how "Error" starts ("" reads back as the text null)
+        const char *szOption; // an option as the result records it
+    } rgCases[] = {
+        // The relay leaves every fourth packet unanswered, so the count shows what came back.
+        {L"-localIP 127.0.0.1 -delay 1 -count 20 127.0.0.1 47211", 47211,
+         "received 20 echoed 15 end idle\n", 0, 20, 15, "null", "\"LocalIP\":\"127.0.0.1\""},
+        {L"-remoteIP -delay 1 -count 3 -size 64 127.0.0.1 47212", 0, nullptr, 0, 3, 0, "null",
+         "\"PacketSize\":64"},
+        {L"-remoteIP -count 3 relay.invalid 47213", 0, nullptr, 1, 0, 0, "cannot resolve the relay",
+         "\"Relay\":\"relay.invalid\""},
+    };
+    for (const auto &c : rgCases)
+    {
+        SCOPED_TRACE(Narrow(c.wszArguments));
+        std::unique_ptr<CRelayProcess> pRelay;
+        if (c.usRelay != 0)
+        {
+            pRelay.reset(new CRelayProcess(c.usRelay, L"-drop 4"));
+            ASSERT_TRUE(pRelay->Listening());
+        }
+        InstallTestApplication(); // no results
+        ChildResult result = RunTestApplication(c.wszArguments);
+        EXPECT_EQ(c.dwExitCode, result.dwExitCode) << result.strOutput;
+        std::vector<std::wstring> rgFiles = ResultFiles();
+        ASSERT_EQ(1u, rgFiles.size());
+        std::string strResult = ReadFileText(rgFiles[0]);
+        std::unique_ptr<JsonValue> pRoot(JsonReader::FromJsonString(strResult.c_str()));
+        ASSERT_EQ(JsonNodeType::Object, pRoot->Type()) << strResult;
+        const JsonObjectNode *pObject = static_cast<const JsonObjectNode *>(pRoot.get());
+        uint32_t ulSent = 0, ulReceived = 0, ulLost = 0;
+        std::string strError;
+        EXPECT_TRUE(pObject->GetMemberNumber("Sent", ulSent));
+        EXPECT_TRUE(pObject->GetMemberNumber("Received", ulReceived));
+        EXPECT_TRUE(pObject->GetMemberNumber("Lost", ulLost));
+        EXPECT_TRUE(pObject->GetMemberText("Error", strError));
+        EXPECT_EQ(c.ulSent, ulSent) << strResult;
+        EXPECT_EQ(c.ulReceived, ulReceived) << strResult;
+        EXPECT_EQ(c.ulSent - c.ulReceived, ulLost) << strResult;
+        EXPECT_EQ(0u, strError.rfind(c.szError, 0)) << strError;
+        EXPECT_NE(std::string::npos, strResult.find(c.szOption)) << strResult;
+        if (pRelay != nullptr)
+        {
+            EXPECT_EQ(c.szReport, pRelay->WaitForReport());
+        }
+    }
 }
 
 TEST_F(ZoRiVirOruz, BadArguments)
@@ -187,12 +99,11 @@ TEST_F(ZoRiVirOruz, BadArguments)
     };
     for (const wchar_t *wszArguments : rgwszArguments)
     {
-        SCOPED_TRACE(testsupport::Narrow(wszArguments));
-        testsupport::ChildResult result = testsupport::RunChild(
-            std::wstring(testsupport::c_wszTestAppPath) + L" " + wszArguments, {}, 30000);
+        SCOPED_TRACE(Narrow(wszArguments));
+        ChildResult result = RunTestApplication(wszArguments);
         EXPECT_EQ(2u, result.dwExitCode) << result.strOutput;
     }
-    EXPECT_TRUE(testsupport::ResultFiles().empty()); // a refused command line measures nothing
+    EXPECT_TRUE(ResultFiles().empty()); // a refused command line measures nothing
 }
 
 TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
@@ -201,18 +112,15 @@ TEST_F(ZoRiVirOruz, KeepsTheNewestResults)
     for (int i = 0; i < 70; i++)
     {
         wchar_t wszName[MAX_PATH];
-        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json",
-                   testsupport::c_wszResultFolder, i);
-        ASSERT_TRUE(udptest::WriteWholeFile(wszName, "{}"));
+        swprintf_s(wszName, L"%s\\result-20200101T0000%02d.000Z-1.json", c_wszResultFolder, i);
+        ASSERT_TRUE(WriteFileText(wszName, "{}"));
     }
-    testsupport::ChildResult result = testsupport::RunChild(
-        std::wstring(testsupport::c_wszTestAppPath) + L" -count 0 127.0.0.1 47214", {}, 60000);
+    ChildResult result = RunTestApplication(L"-count 0 127.0.0.1 47214");
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
-    std::vector<std::wstring> rgFiles = testsupport::ResultFiles();
+    std::vector<std::wstring> rgFiles = ResultFiles();
     EXPECT_EQ(64u, rgFiles.size());
     std::sort(rgFiles.begin(), rgFiles.end());
-    EXPECT_EQ(std::wstring(testsupport::c_wszResultFolder) +
-                  L"\\result-20200101T000007.000Z-1.json",
+    EXPECT_EQ(std::wstring(c_wszResultFolder) + L"\\result-20200101T000007.000Z-1.json",
               rgFiles.front());
     EXPECT_EQ(std::wstring::npos, rgFiles.back().find(L"result-2020")); // the new run
 }
