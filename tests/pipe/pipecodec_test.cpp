@@ -111,21 +111,19 @@ const char *ReceiptLine(bool fCollector, PIPE_MESSAGE_KIND kind)
     switch (kind)
     {
     case PipeMessageVersion:
-        return fCollector
-                   ? "CServiceCollector::IncomingMessage() - TELVANE_VERSION_NEGOTIATE_OPCODE"
-                   : "CServiceActivity::IncomingMessage() - TELVANE_VERSION_NEGOTIATE_OPCODE";
+        return fCollector ? c_szPipeTraceCollectorVersion : c_szPipeTraceActivityVersion;
     case PipeMessageStartActivity:
-        return "CServiceActivity::IncomingMessage() - TELVANE_START_ACTIVITY_OPCODE";
+        return c_szPipeTraceActivityStart;
     case PipeMessageActivityEvent:
-        return "CServiceActivity::IncomingMessage() - TELVANE_ACTIVITY_EVENT_OPCODE";
+        return c_szPipeTraceActivityEvent;
     case PipeMessageStopActivity:
-        return "CServiceActivity::IncomingMessage() - TELVANE_STOP_ACTIVITY_OPCODE";
+        return c_szPipeTraceActivityStop;
     case PipeMessageRegisterCollector:
-        return "CServiceCollector::IncomingMessage() - TELVANE_REGISTER_COLLECTOR_OPCODE";
+        return c_szPipeTraceCollectorRegister;
     case PipeMessageCollectionComplete:
-        return "CServiceCollector::IncomingMessage() - TELVANE_COLLECTION_COMPLETE_OPCODE";
+        return c_szPipeTraceCollectorResult;
     case PipeMessageBreakPipe:
-        return "CServiceCollector::IncomingMessage() - asked to break pipe";
+        return c_szPipeTraceCollectorBreak;
     default:
         return nullptr;
     }
@@ -133,13 +131,9 @@ const char *ReceiptLine(bool fCollector, PIPE_MESSAGE_KIND kind)
 
 std::vector<CodecRow> CodecRows()
 {
-    const char *szActivitySize = "***CServiceActivity - invalid message size, closing pipe";
-    const char *szStartSize =
-        "***CServiceActivity - invalid message size(TELVANE_START_ACTIVITY), closing pipe";
-    const char *szEventSize =
-        "***CServiceActivity - invalid message size(TELVANE_ACTIVITY_EVENT), closing pipe";
-    const char *szCollectorSize =
-        "***CServiceCollector - invalid size (TELVANE_PACKET), closing pipe";
+    const char *szStartSize = c_szPipeFaultActivityStartSize;
+    const char *szEventSize = c_szPipeFaultActivityEventSize;
+    const char *szCollectorSize = c_szPipeFaultCollectorSize;
     const std::string strFullEvent(TELVANE_MAX_EVENT_PART, 'f');
     const std::string strFullResult(TELVANE_MAX_RESULT_PART, 'r');
     const bool A = false;
@@ -207,7 +201,8 @@ std::vector<CodecRow> CodecRows()
     // Shorter than an opcode: no receipt line, only the fault.
     for (uint8_t cb = 0; cb < 4; cb++)
     {
-        rgRows.push_back({"short", A, Bytes(cb, 1), PipeMessageInvalid, szActivitySize, "", false});
+        rgRows.push_back(
+            {"short", A, Bytes(cb, 1), PipeMessageInvalid, c_szPipeFaultActivitySize, "", false});
         rgRows.push_back(
             {"short", C, Bytes(cb, 1), PipeMessageInvalid, szCollectorSize, "", false});
     }
@@ -215,12 +210,12 @@ std::vector<CodecRow> CodecRows()
     for (uint32_t ulOpcode : {0u, 5u, 6u, 7u, 8u, 9u, 0xFFFFFFFFu})
     {
         rgRows.push_back({"opcode", A, CMessage(ulOpcode).Guid(0).Get(), PipeMessageInvalid,
-                          "***CServiceActivity - invalid opcode, closing pipe", "", false});
+                          c_szPipeFaultActivityOpcode, "", false});
     }
     for (uint32_t ulOpcode : {0u, 2u, 3u, 4u, 6u, 9u, 0x80000001u})
     {
         rgRows.push_back({"opcode", C, CMessage(ulOpcode).Guid(0).Guid(0).Get(), PipeMessageInvalid,
-                          "***CServiceCollector::IncomingMessage() - invalid opcode", "", false});
+                          c_szPipeFaultCollectorOpcode, "", false});
     }
     return rgRows;
 }
