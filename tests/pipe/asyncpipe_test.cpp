@@ -159,7 +159,8 @@ protected:
 };
 
 // Holds the pipe's Synchronizer busy in one marked event, so that what is posted meanwhile
-// waits in the queue while the pipe's instance and its clients move on.
+// waits in the queue while the pipe's instance and its clients move on. The hold runs on the
+// Synchronizer's thread; the test owns the pipe like any other.
 class CHeldPipe : public AsyncPipe
 {
 public:
@@ -193,8 +194,8 @@ public:
 } // namespace
 
 // The life of a connection whose client opened the instance before the pipe's connect call was
-// issued (535): connected notice, a full-size message delivered whole and echoed, then the
-// client leaves while a read is pending.
+// issued (which then answers ERROR_PIPE_CONNECTED): connected notice, a full-size message
+// delivered whole and echoed, then the client leaves while a read is pending.
 TEST_F(AsyncPipeTest, DeliversWholeMessagesAndOneBreakWhenClientLeaves)
 {
     std::wstring name = UniquePipeName(L"life");

@@ -348,23 +348,28 @@ TEST_F(TelvaneClient, TelvanectlPlaysActivitiesAndACollector)
     });
     bool fRegistered = m_trace.WaitFor("TelvaneService::ReportConnectedCollector()");
     GUID textEvent = NewGuid();
+    GUID jsonEvent = NewGuid();
     GUID fileEvent = NewGuid();
     GUID rgLogIds[2] = {NewLogId(), NewLogId()};
     GUID activityId = NewGuid();
     // With braces and without: both forms of a GUID are taken.
     std::wstring wstrRun = L"activity --pipe " + m_coordinator.ActivityPipe() + L" {" +
                            Widen(GuidText(activityId)) + L"} ";
-    ChildResult first = RunTelvanectl(
-        wstrRun + Widen(GuidText(rgLogIds[0])) + L" " + Widen(GuidText(textEvent)) +
-        L"=h\u00e9llo " + Widen(GuidText(fileEvent)) + L"=@" + wstrFolder + L"\\event.json");
+    ChildResult first =
+        RunTelvanectl(wstrRun + Widen(GuidText(rgLogIds[0])) + L" " + Widen(GuidText(textEvent)) +
+                      L"=h\u00e9llo " + Widen(GuidText(jsonEvent)) + L"=[1,2] " +
+                      Widen(GuidText(fileEvent)) + L"=@" + wstrFolder + L"\\event.json");
     ChildResult second = RunTelvanectl(wstrRun + Widen(GuidText(rgLogIds[1])));
     tool.join();
     RemoveTree(wstrFolder);
     ASSERT_TRUE(fRegistered) << collector.strOutput;
     EXPECT_EQ(0u, first.dwExitCode) << first.strOutput;
+    // The text goes in UTF-8 without a terminator (the service would drop what follows a zero).
     EXPECT_NE(std::string::npos,
-              first.strOutput.find("sent event " + GuidText(fileEvent) + ": 3000 bytes"))
+              first.strOutput.find("sent event " + GuidText(textEvent) + ": 6 bytes"))
         << first.strOutput;
+    EXPECT_NE(std::string::npos,
+              first.strOutput.find("sent event " + GuidText(fileEvent) + ": 3000 bytes"));
     EXPECT_EQ(0u, second.dwExitCode) << second.strOutput;
     EXPECT_EQ(0u, collector.dwExitCode) << collector.strOutput;
     EXPECT_NE(std::string::npos, collector.strOutput.find("log " + GuidText(rgLogIds[1]) +
@@ -383,6 +388,7 @@ TEST_F(TelvaneClient, TelvanectlPlaysActivitiesAndACollector)
     // Text that is no JSON is recorded byte by byte: the two UTF-8 bytes of the accent come
     // back as two characters.
     EXPECT_EQ(Values("\"h\xC3\x83\xC2\xA9llo\""), GroupValues(*rgFirst[0].doc, textEvent));
+    EXPECT_EQ(Values("[1,2]"), GroupValues(*rgFirst[0].doc, jsonEvent));
     EXPECT_EQ(Values(strFileEvent), GroupValues(*rgFirst[0].doc, fileEvent));
     EXPECT_TRUE(m_trace.WaitFor(c_szPipeTraceCollectorBreak)) << "the tool leaves after 2 requests";
 }

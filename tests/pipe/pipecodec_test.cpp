@@ -12,7 +12,7 @@ namespace
 {
 typedef std::vector<uint8_t> Bytes;
 
-// Message builder: little-endian words and raw bytes appended in order.
+// Message builder: little-endian words and raw bytes appended in order (test thread only).
 class CMessage
 {
 public:

@@ -9,6 +9,7 @@ using namespace testsupport;
 
 namespace
 {
+// Each test's keys live under a base of its own, removed when it ends; test thread only.
 class RegHelper : public ::testing::Test
 {
 protected:

@@ -75,7 +75,8 @@ bool GroupValueExists(const std::wstring &wstrGroup)
     return testsupport::HklmReadRaw(c_wszSvchostGroupKey, wstrGroup.c_str(), &dwType, &wstrData);
 }
 
-// A demand-start test service with resource ids, removed again whatever the test did.
+// A demand-start test service with resource ids, removed again whatever the test did; owned by
+// the test thread.
 class CInstallService : public CTestService
 {
 public:
@@ -91,6 +92,7 @@ public:
     ~CInstallService() override { testsupport::ServiceStopAndDelete(ServiceName()); }
 };
 
+// Records the failure-action calls through the seam while a test runs; test thread only.
 class ServiceInstall : public ::testing::Test
 {
 protected:

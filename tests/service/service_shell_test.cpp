@@ -45,6 +45,8 @@ std::vector<REPORT> Reports()
     return s_rgReports;
 }
 
+// Every test starts with an empty service list and records what would reach the control
+// manager; services are the test's locals, driven from the test thread.
 class ServiceShell : public ::testing::Test
 {
 protected:
@@ -285,7 +287,8 @@ HANDLE NewManualEvent()
     return CreateEventW(nullptr, TRUE, FALSE, nullptr);
 }
 
-// Lets a held stop callback finish and waits for it when the test ends, however it ends.
+// Lets a held stop callback (on the host's callback thread) finish and waits for it when the
+// test ends, however it ends. Owned by the test.
 class CCallbacksDone
 {
 public:

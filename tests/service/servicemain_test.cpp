@@ -16,7 +16,7 @@ using namespace testsupport;
 namespace
 {
 // The release event of a "hold-stop" service (see childservice.h), signalled and closed however
-// the test ends so that the service can stop before the test removes it.
+// the test ends so that the service can stop before the test removes it. Test thread only.
 class CReleaseOnExit
 {
 public:
