@@ -1,39 +1,32 @@
 // The registry helpers against the prefix's real registry, each test under a key of its own.
+// Test thread only.
 #include "servicelib/reghelper.h"
 #include "tests/common/testsupport.h"
-#include "tests/common/scmtest.h"
 
 #include <gtest/gtest.h>
 
-#include <thread>
-
-using testsupport::FailureCapture;
+using namespace testsupport;
 
 namespace
 {
-const DWORD c_dwWaitMs = 10000;
-
+// Each test's keys live under a base of its own, removed when it ends; test thread only.
 class RegHelper : public ::testing::Test
 {
 protected:
-    void SetUp() override { m_wstrBase = L"SOFTWARE\\TelvaneTest\\" + testsupport::UniqueName(L"Reg"); }
     void TearDown() override { RegDeleteTreeW(HKEY_LOCAL_MACHINE, m_wstrBase.c_str()); }
-
     std::wstring Path(const wchar_t *wszSub) const { return m_wstrBase + L"\\" + wszSub; }
 
-    void WriteRaw(const std::wstring &wstrPath, const wchar_t *wszValue, DWORD dwType,
-                  const void *pvData, DWORD cb)
-    {
-        HKEY hKey = nullptr;
-        ASSERT_EQ(ERROR_SUCCESS, RegCreateKeyExW(HKEY_LOCAL_MACHINE, wstrPath.c_str(), 0, nullptr,
-                                                 0, KEY_WRITE, nullptr, &hKey, nullptr));
-        ASSERT_EQ(ERROR_SUCCESS,
-                  RegSetValueExW(hKey, wszValue, 0, dwType, static_cast<const BYTE *>(pvData), cb));
-        RegCloseKey(hKey);
-    }
-
-    std::wstring m_wstrBase;
+    const std::wstring m_wstrBase = L"SOFTWARE\\TelvaneTest\\" + UniqueName(L"Reg");
 };
+
+std::wstring Raw(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD dwTypeExpected)
+{
+    DWORD dwType = 0;
+    std::wstring wstrRaw;
+    EXPECT_TRUE(HklmReadRaw(wstrKey, wszValue, &dwType, &wstrRaw));
+    EXPECT_EQ(dwTypeExpected, dwType);
+    return wstrRaw;
+}
 } // namespace
 
 TEST_F(RegHelper, MissingKeysAndValuesAreTolerated)
@@ -54,7 +47,7 @@ TEST_F(RegHelper, MissingKeysAndValuesAreTolerated)
 
     // The root is HKEY_LOCAL_MACHINE itself and is never closed.
     EXPECT_EQ(HKEY_LOCAL_MACHINE, RegHelperOpenKey(nullptr, false));
-    EXPECT_EQ(HKEY_LOCAL_MACHINE, RegHelperOpenKey(L"", true));
+    EXPECT_EQ(HKEY_LOCAL_MACHINE, RegHelperCreateKey(L""));
     RegHelperCloseKey(HKEY_LOCAL_MACHINE);
     HKEY hKey = RegHelperOpenKey(L"SOFTWARE", false);
     EXPECT_NE(nullptr, hKey);
@@ -62,115 +55,102 @@ TEST_F(RegHelper, MissingKeysAndValuesAreTolerated)
     EXPECT_EQ(0u, failures.Count());
 }
 
-TEST_F(RegHelper, StringsGrowPastTheFirstBuffer)
+// Values as other writers leave them, read back as text and as a list.
+TEST_F(RegHelper, ReadsValuesAsOtherWritersLeaveThem)
 {
-    std::wstring wstrKey = Path(L"Long");
+    // Longer than the first expansion buffer, so the expansion grows too.
+    std::wstring wstrDir = L"C:\\" + std::wstring(600, L'd');
+    ASSERT_TRUE(SetEnvironmentVariableW(L"TELVANE_TEST_DIR", wstrDir.c_str()));
     std::wstring wstrLong;
     for (int i = 0; i < 5000; i++)
     {
         wstrLong.push_back(static_cast<wchar_t>(L'a' + i % 26));
     }
-    RegHelperSetString(wstrKey.c_str(), L"Long", wstrLong, REG_SZ);
-    EXPECT_EQ(wstrLong, RegHelperGetString(wstrKey.c_str(), L"Long"));
-
-    // Written as the text plus one terminator.
-    DWORD dwType = 0;
-    std::wstring wstrRaw;
-    ASSERT_TRUE(testsupport::HklmReadRaw(wstrKey, L"Long", &dwType, &wstrRaw));
-    EXPECT_EQ(static_cast<DWORD>(REG_SZ), dwType);
-    EXPECT_EQ(wstrLong + std::wstring(1, L'\0'), wstrRaw);
-
-    // Trailing zeros of a value are not part of the text.
-    const wchar_t wszPadded[] = L"abc\0\0\0";
-    WriteRaw(wstrKey, L"Padded", REG_SZ, wszPadded, sizeof(wszPadded));
-    EXPECT_EQ(L"abc", RegHelperGetString(wstrKey.c_str(), L"Padded"));
-
-    // A long value of an odd byte count still fits after growing (it must not loop).
-    std::wstring wstrOdd(400, L'z');
-    WriteRaw(wstrKey, L"Odd", REG_SZ, wstrOdd.c_str(), 801);
-    std::wstring wstrRead;
-    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
-    std::thread reader([&] {
-        wstrRead = RegHelperGetString(wstrKey.c_str(), L"Odd");
-        SetEvent(hDone);
-    });
-    DWORD dwWait = WaitForSingleObject(hDone, c_dwWaitMs);
-    ASSERT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait) << "RegHelperGetString never returned";
-    reader.join();
-    CloseHandle(hDone);
-    EXPECT_EQ(wstrOdd, wstrRead);
-}
-
-TEST_F(RegHelper, ExpandSzIsExpandedAndSzIsNot)
-{
-    std::wstring wstrKey = Path(L"Expand");
-    // Longer than the first expansion buffer, so the expansion grows too.
-    std::wstring wstrDir = L"C:\\" + std::wstring(600, L'd');
-    ASSERT_TRUE(SetEnvironmentVariableW(L"TELVANE_TEST_DIR", wstrDir.c_str()));
-    RegHelperSetString(wstrKey.c_str(), L"Expand", L"%TELVANE_TEST_DIR%\\telvane.dll",
-                       REG_EXPAND_SZ);
-    RegHelperSetString(wstrKey.c_str(), L"Plain", L"%TELVANE_TEST_DIR%\\telvane.dll", REG_SZ);
-    EXPECT_EQ(wstrDir + L"\\telvane.dll", RegHelperGetString(wstrKey.c_str(), L"Expand"));
-    EXPECT_EQ(L"%TELVANE_TEST_DIR%\\telvane.dll", RegHelperGetString(wstrKey.c_str(), L"Plain"));
-    // An unknown variable stays as written, as the platform expands it.
-    RegHelperSetString(wstrKey.c_str(), L"Unknown", L"%TELVANE_NO_SUCH_VAR%", REG_EXPAND_SZ);
-    EXPECT_EQ(L"%TELVANE_NO_SUCH_VAR%", RegHelperGetString(wstrKey.c_str(), L"Unknown"));
+    const std::wstring wstrVar = L"%TELVANE_TEST_DIR%\\telvane.dll";
+    struct
+    {
+        const wchar_t *wszName;
+        DWORD dwType;
+        std::wstring wstrData;
+        DWORD cb; // 0: the whole of wstrData
+        std::wstring wstrText;
+        std::vector<std::wstring> rgList;
+    } rgCases[] = {
+        // Past the first buffer; and of an odd byte count, which must still fit after growing.
+        {L"Long", REG_SZ, wstrLong, 0, wstrLong, {wstrLong}},
+        {L"Odd", REG_SZ, std::wstring(401, L'z'), 801, std::wstring(400, L'z'), {}},
+        // Trailing zeros are not part of the text.
+        {L"Padded", REG_SZ, std::wstring(L"abc\0\0\0", 6), 0, L"abc", {L"abc"}},
+        {L"Expand", REG_EXPAND_SZ, wstrVar, 0, wstrDir + L"\\telvane.dll", {}},
+        {L"Plain", REG_SZ, wstrVar, 0, wstrVar, {}},
+        // An unknown variable stays as written, as the platform expands it.
+        {L"Unknown", REG_EXPAND_SZ, L"%TELVANE_NO_SUCH_VAR%", 0, L"%TELVANE_NO_SUCH_VAR%", {}},
+        // Neither extra zeros at the end nor an empty entry in the middle (which ends the list
+        // for other readers) give empty entries.
+        {L"Multi",
+         REG_MULTI_SZ,
+         std::wstring(L"x\0y\0\0\0\0", 7),
+         0,
+         std::wstring(L"x\0y", 3),
+         {L"x", L"y"}},
+        {L"Gap",
+         REG_MULTI_SZ,
+         std::wstring(L"a\0\0b\0\0", 6),
+         0,
+         std::wstring(L"a\0\0b", 4),
+         {L"a", L"b"}},
+    };
+    std::wstring wstrKey = Path(L"Read");
+    for (const auto &testCase : rgCases)
+    {
+        SCOPED_TRACE(Narrow(testCase.wszName));
+        DWORD cb = testCase.cb != 0
+                       ? testCase.cb
+                       : static_cast<DWORD>(testCase.wstrData.size() * sizeof(wchar_t));
+        HklmSetBytes(wstrKey, testCase.wszName, testCase.dwType, testCase.wstrData.data(), cb);
+        EXPECT_EQ(testCase.wstrText, RegHelperGetString(wstrKey.c_str(), testCase.wszName));
+        if (!testCase.rgList.empty())
+        {
+            EXPECT_EQ(testCase.rgList, RegHelperGetMultiString(wstrKey.c_str(), testCase.wszName));
+        }
+    }
     SetEnvironmentVariableW(L"TELVANE_TEST_DIR", nullptr);
 }
 
-TEST_F(RegHelper, MultiStringsRoundTripWithoutEmptyEntries)
+// What the helpers write is what every other reader expects: the text and one terminator, a
+// list without empty entries and its closing zero.
+TEST_F(RegHelper, WritesWhatOtherReadersExpect)
 {
-    std::wstring wstrKey = Path(L"Multi");
+    std::wstring wstrKey = Path(L"Write");
+    RegHelperSetString(wstrKey.c_str(), L"Text", L"some text", REG_SZ);
+    EXPECT_EQ(std::wstring(L"some text\0", 10), Raw(wstrKey, L"Text", REG_SZ));
+    RegHelperSetString(wstrKey.c_str(), L"Expand", L"%x%", REG_EXPAND_SZ);
+    EXPECT_EQ(std::wstring(L"%x%\0", 4), Raw(wstrKey, L"Expand", REG_EXPAND_SZ));
+
     std::vector<std::wstring> rgList = {L"Telvane", L"Other", L"Third"};
     RegHelperSetMultiString(wstrKey.c_str(), L"Group", rgList);
+    EXPECT_EQ(std::wstring(L"Telvane\0Other\0Third\0\0", 21), Raw(wstrKey, L"Group", REG_MULTI_SZ));
     EXPECT_EQ(rgList, RegHelperGetMultiString(wstrKey.c_str(), L"Group"));
-
-    DWORD dwType = 0;
-    std::wstring wstrRaw;
-    ASSERT_TRUE(testsupport::HklmReadRaw(wstrKey, L"Group", &dwType, &wstrRaw));
-    EXPECT_EQ(static_cast<DWORD>(REG_MULTI_SZ), dwType);
-    EXPECT_EQ(std::wstring(L"Telvane\0Other\0Third\0\0", 21), wstrRaw);
-
-    // Extra zeros at the end (as other writers leave them) give no empty entries.
-    const wchar_t wszPadded[] = L"x\0y\0\0\0\0";
-    WriteRaw(wstrKey, L"Padded", REG_MULTI_SZ, wszPadded, sizeof(wszPadded));
-    EXPECT_EQ((std::vector<std::wstring>{L"x", L"y"}),
-              RegHelperGetMultiString(wstrKey.c_str(), L"Padded"));
-
-    // Nor does an empty entry in the middle, which ends the list for other readers.
-    const wchar_t wszGap[] = L"a\0\0b\0\0";
-    WriteRaw(wstrKey, L"Gap", REG_MULTI_SZ, wszGap, sizeof(wszGap));
-    EXPECT_EQ((std::vector<std::wstring>{L"a", L"b"}),
-              RegHelperGetMultiString(wstrKey.c_str(), L"Gap"));
-
-    // An empty entry would end the list for every other reader: it is not written.
     RegHelperSetMultiString(wstrKey.c_str(), L"Gaps", {L"a", L"", L"b"});
-    ASSERT_TRUE(testsupport::HklmReadRaw(wstrKey, L"Gaps", &dwType, &wstrRaw));
-    EXPECT_EQ(std::wstring(L"a\0b\0\0", 5), wstrRaw);
-    EXPECT_EQ((std::vector<std::wstring>{L"a", L"b"}),
-              RegHelperGetMultiString(wstrKey.c_str(), L"Gaps"));
+    EXPECT_EQ(std::wstring(L"a\0b\0\0", 5), Raw(wstrKey, L"Gaps", REG_MULTI_SZ));
 
-    // A plain string reads as a list of one.
-    RegHelperSetString(wstrKey.c_str(), L"Single", L"alone", REG_SZ);
-    EXPECT_EQ((std::vector<std::wstring>{L"alone"}),
-              RegHelperGetMultiString(wstrKey.c_str(), L"Single"));
+    RegHelperSetDword(wstrKey.c_str(), L"Number", 0x12345678);
+    DWORD dw = 0;
+    ASSERT_TRUE(HklmReadDword(wstrKey, L"Number", &dw));
+    EXPECT_EQ(0x12345678u, dw);
 }
 
-TEST_F(RegHelper, DwordsKeysAndDeletion)
+TEST_F(RegHelper, KeysAndDeletion)
 {
     FailureCapture failures;
     std::wstring wstrKey = Path(L"Deep\\Er\\Key");
-    RegHelperSetDword(wstrKey.c_str(), L"Number", 0x12345678);
-    DWORD dw = 0;
-    ASSERT_TRUE(testsupport::HklmReadDword(wstrKey, L"Number", &dw));
-    EXPECT_EQ(0x12345678u, dw);
-
     HKEY hKey = RegHelperCreateKey(wstrKey.c_str());
     ASSERT_NE(nullptr, hKey);
     RegHelperCloseKey(hKey);
-
+    RegHelperSetDword(wstrKey.c_str(), L"Number", 1);
     RegHelperDeleteValue(wstrKey.c_str(), L"Number");
-    EXPECT_FALSE(testsupport::HklmReadDword(wstrKey, L"Number", &dw));
+    DWORD dw = 0;
+    EXPECT_FALSE(HklmReadDword(wstrKey, L"Number", &dw));
 
     // The two parts join as they stand: no separator is added between them.
     std::wstring wstrParent = Path(L"Deep\\Er");

@@ -1,6 +1,6 @@
 // Installation through the prefix's real control manager, with test-only service and group
 // names so that these tests run beside everything else. The failure actions are checked at
-// the call: Wine accepts them and stores nothing.
+// the call: Wine accepts them and stores nothing. Test thread only.
 #include "servicelib/reghelper.h"
 #include "tests/common/testsupport.h"
 #include "tests/common/scmtest.h"
@@ -75,7 +75,8 @@ bool GroupValueExists(const std::wstring &wstrGroup)
     return testsupport::HklmReadRaw(c_wszSvchostGroupKey, wstrGroup.c_str(), &dwType, &wstrData);
 }
 
-// A demand-start test service with resource ids, removed again whatever the test did.
+// A demand-start test service with resource ids, removed again whatever the test did; owned by
+// the test thread.
 class CInstallService : public CTestService
 {
 public:
@@ -91,22 +92,7 @@ public:
     ~CInstallService() override { testsupport::ServiceStopAndDelete(ServiceName()); }
 };
 
-// Removes a test group's value from the host group key when the test ends, however it ends.
-class CGroupCleanup
-{
-public:
-    explicit CGroupCleanup(const std::wstring &wstrGroup)
-        : m_wstrGroup(wstrGroup)
-    {
-    }
-    ~CGroupCleanup() { RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str()); }
-    CGroupCleanup(const CGroupCleanup &) = delete;
-    CGroupCleanup &operator=(const CGroupCleanup &) = delete;
-
-private:
-    std::wstring m_wstrGroup;
-};
-
+// Records the failure-action calls through the seam while a test runs; test thread only.
 class ServiceInstall : public ::testing::Test
 {
 protected:
@@ -121,7 +107,11 @@ protected:
     {
         ServiceSetChangeConfig2Hook(nullptr);
         CTestService::SetHostMode(false, nullptr, nullptr);
+        RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str());
     }
+
+    // A host group of the test's own, removed when the test ends.
+    const std::wstring m_wstrGroup = testsupport::UniqueName(L"TelvaneTestGroup");
 };
 } // namespace
 
@@ -173,26 +163,14 @@ TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
     EXPECT_EQ(2, service.m_cUnregisters);
     // A second removal finds nothing and is not an error.
     service.UnregisterOneService();
-    EXPECT_EQ(0u, failures.Count());
-}
 
-TEST_F(ServiceInstall, DefaultsAndSharedProcessForSeveralServices)
-{
-    CTestService plain(L"Plain");
-    EXPECT_EQ(static_cast<ULONG>(SERVICE_AUTO_START), plain.m_ulStartType);
-    EXPECT_EQ(static_cast<ULONG>(SC_ACTION_RESTART), plain.m_ulFailureAction);
-    EXPECT_EQ(0u, plain.m_idsLocalizedName);
-    EXPECT_EQ(0u, plain.m_idsDescription);
-
-    CInstallService first(testsupport::UniqueName(L"TelvaneTestSvc"));
-    CInstallService second(testsupport::UniqueName(L"TelvaneTestSvc"));
-    CService::RegisterService(&first);
-    CService::RegisterService(&second);
-    first.RegisterOneService();
-    testsupport::SERVICE_RECORD record;
-    ASSERT_TRUE(testsupport::ServiceReadRecord(first.ServiceName(), &record));
+    // A program that lists several services shares its process among them.
+    CInstallService other(testsupport::UniqueName(L"TelvaneTestSvc"));
+    CService::RegisterService(&other);
+    service.RegisterOneService();
+    ASSERT_TRUE(testsupport::ServiceReadRecord(service.ServiceName(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
-    EXPECT_EQ(ExePath(), record.wstrBinaryPath);
+    EXPECT_EQ(0u, failures.Count());
 }
 
 TEST_F(ServiceInstall, ZeroResourceIdsStopAtTheAssertions)
@@ -212,8 +190,7 @@ TEST_F(ServiceInstall, ZeroResourceIdsStopAtTheAssertions)
 TEST_F(ServiceInstall, HostDllValuesAndGroupList)
 {
     FailureCapture failures;
-    std::wstring wstrGroup = testsupport::UniqueName(L"TelvaneTestGroup");
-    CGroupCleanup groupCleanup(wstrGroup);
+    const std::wstring &wstrGroup = m_wstrGroup;
     CTestService::SetHostMode(true, wstrGroup.c_str(), nullptr);
     // Someone else's service in the group stays where it is.
     RegHelperSetMultiString(c_wszSvchostGroupKey, wstrGroup.c_str(), {L"Other"});

@@ -1,101 +1,91 @@
-// telvane.dll installed, started and stopped under its real name through the prefix's
-// control manager: with telvanerun, under Wine's own svchost.exe (no host globals) and under
-// telvanehost.exe (the host's stop callback). These tests own the name "Telvane" and the
-// group "OVTCBNetwork" while they run, and remove the service whatever happens.
+// telvane.dll installed, started and stopped under its real name through the prefix's control
+// manager with the product's own steps: under Wine's own svchost.exe (no host globals) and
+// under telvanehost.exe (the host's stop callback). These tests own the name "Telvane" and the
+// group "OVTCBNetwork" while they run (the suite is serial), and remove the service however
+// they end. Test thread only.
 #include "servicelib/reghelper.h"
 #include "servicelib/service.h"
 #include "service/resource.h"
-#include "tests/common/testsupport.h"
 #include "tests/common/scmtest.h"
 
 #include <gtest/gtest.h>
 
 #include <algorithm>
 
+using namespace testsupport;
+
 namespace
 {
-const wchar_t c_wszTelvane[] = L"Telvane";
 const wchar_t c_wszGroup[] = L"OVTCBNetwork";
 const wchar_t c_wszParameters[] = L"SYSTEM\\CurrentControlSet\\Services\\Telvane\\Parameters";
-const DWORD c_dwStateWaitMs = 30000;
 
-testsupport::ChildResult RunTelvane(const wchar_t *wszArgs)
-{
-    return testsupport::RunChild(L"\"" + testsupport::BinDir() + L"telvanerun.exe\" " + wszArgs);
-}
-
-size_t GroupEntries()
-{
-    std::vector<std::wstring> rgGroup = RegHelperGetMultiString(c_wszSvchostGroupKey, c_wszGroup);
-    return static_cast<size_t>(std::count(rgGroup.begin(), rgGroup.end(), c_wszTelvane));
-}
-
-bool GroupValueExists()
+// How often the group lists the service; -1 when the group's value is gone.
+int GroupEntries()
 {
     DWORD dwType = 0;
     std::wstring wstrData;
-    return testsupport::HklmReadRaw(c_wszSvchostGroupKey, c_wszGroup, &dwType, &wstrData);
+    if (!HklmReadRaw(c_wszSvchostGroupKey, c_wszGroup, &dwType, &wstrData))
+    {
+        return -1;
+    }
+    std::vector<std::wstring> rgGroup = RegHelperGetMultiString(c_wszSvchostGroupKey, c_wszGroup);
+    return static_cast<int>(std::count(rgGroup.begin(), rgGroup.end(), c_wszTelvane));
 }
 
 std::wstring LoadDllString(UINT uId)
 {
-    std::wstring wstrDll = testsupport::BinDir() + L"telvane.dll";
-    HMODULE hDll = LoadLibraryExW(wstrDll.c_str(), nullptr, LOAD_LIBRARY_AS_DATAFILE);
-    if (hDll == nullptr)
-    {
-        return L"";
-    }
+    HMODULE hDll =
+        LoadLibraryExW((BinDir() + L"telvane.dll").c_str(), nullptr, LOAD_LIBRARY_AS_DATAFILE);
     wchar_t wszText[512] = L"";
-    LoadStringW(hDll, uId, wszText, 512);
-    FreeLibrary(hDll);
+    if (hDll != nullptr)
+    {
+        LoadStringW(hDll, uId, wszText, 512);
+        FreeLibrary(hDll);
+    }
     return wszText;
 }
 
-class TelvaneInstall : public ::testing::Test
+// Installs with telvanerun alone: the platform component, which these tests do not look at,
+// would make every start and stop slower.
+class TelvaneScm : public ::testing::Test
 {
 protected:
-    void SetUp() override { ASSERT_EQ(0u, RunTelvane(L"-u").dwExitCode); }
+    void SetUp() override { TearDown(); }
     void TearDown() override
     {
         RunTelvane(L"-u");
-        testsupport::ServiceStopAndDelete(c_wszTelvane);
+        ServiceStopAndDelete(c_wszTelvane);
     }
 
     // Starts the service, checks which program hosts it, stops it and sees the host leave.
     void StartAndStop(const wchar_t *wszHostImage)
     {
-        SCOPED_TRACE(testsupport::Narrow(wszHostImage));
-        ASSERT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
+        SCOPED_TRACE(Narrow(wszHostImage));
+        CServiceProcess host(TelvaneStart());
+        ASSERT_TRUE(host.Opened());
         SERVICE_STATUS_PROCESS status = {};
-        ASSERT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs, &status))
-            << status.dwCurrentState;
+        ASSERT_TRUE(ServiceQueryStatus(c_wszTelvane, &status));
         EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), status.dwServiceType);
         EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP), status.dwControlsAccepted);
+        EXPECT_NE(std::wstring::npos, host.ImageName().find(wszHostImage))
+            << Narrow(host.ImageName());
 
-        testsupport::CServiceProcess host(status.dwProcessId);
-        ASSERT_TRUE(host.Opened());
-        std::wstring wstrImage = host.ImageName();
-        EXPECT_NE(std::wstring::npos, wstrImage.find(wszHostImage))
-            << testsupport::Narrow(wstrImage);
-
-        EXPECT_EQ(0u, testsupport::ServiceStop(c_wszTelvane));
-        EXPECT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_STOPPED, c_dwStateWaitMs, &status));
+        EXPECT_TRUE(TelvaneStop());
+        ASSERT_TRUE(ServiceQueryStatus(c_wszTelvane, &status));
         EXPECT_EQ(0u, status.dwWin32ExitCode);
-
         // The host leaves once its only service has stopped.
-        EXPECT_EQ(0u, host.WaitForExitCode(c_dwStateWaitMs));
+        EXPECT_EQ(0u, host.WaitForExitCode(c_dwWaitMs));
     }
 };
 } // namespace
 
-TEST_F(TelvaneInstall, RegisterRunUnderSvchostAndUnregister)
+TEST_F(TelvaneScm, RegisterRunUnderSvchostAndUnregister)
 {
-    testsupport::ChildResult result = RunTelvane(L"-r");
+    ChildResult result = RunTelvane(L"-r");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-
-    std::wstring wstrDll = testsupport::BinDir() + L"telvane.dll";
-    testsupport::SERVICE_RECORD record;
-    ASSERT_TRUE(testsupport::ServiceReadRecord(c_wszTelvane, &record));
+    std::wstring wstrDll = BinDir() + L"telvane.dll";
+    SERVICE_RECORD record;
+    ASSERT_TRUE(ServiceReadRecord(c_wszTelvane, &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), record.dwServiceType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_AUTO_START), record.dwStartType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_ERROR_NORMAL), record.dwErrorControl);
@@ -111,53 +101,42 @@ TEST_F(TelvaneInstall, RegisterRunUnderSvchostAndUnregister)
 
     DWORD dwType = 0;
     std::wstring wstrServiceDll;
-    ASSERT_TRUE(testsupport::HklmReadRaw(c_wszParameters, L"ServiceDll", &dwType, &wstrServiceDll));
+    ASSERT_TRUE(HklmReadRaw(c_wszParameters, L"ServiceDll", &dwType, &wstrServiceDll));
     EXPECT_EQ(static_cast<DWORD>(REG_EXPAND_SZ), dwType);
     EXPECT_EQ(wstrDll, RegHelperGetString(c_wszParameters, L"ServiceDll"));
     DWORD dwUnload = 0;
-    ASSERT_TRUE(testsupport::HklmReadDword(c_wszParameters, L"ServiceDllUnloadOnStop", &dwUnload));
+    ASSERT_TRUE(HklmReadDword(c_wszParameters, L"ServiceDllUnloadOnStop", &dwUnload));
     EXPECT_EQ(1u, dwUnload);
-    EXPECT_EQ(1u, GroupEntries());
+    EXPECT_EQ(1, GroupEntries());
 
     // Wine's svchost never pushes host globals: the DLL lists its service in ServiceMain and
     // stops it on the dispatcher thread.
     StartAndStop(L"svchost.exe");
 
-    // Registering again, even while the service runs, leaves one installation and one entry.
-    ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
-    EXPECT_EQ(1u, GroupEntries());
-    ASSERT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
-    ASSERT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs));
+    // Registering again while the service runs leaves one installation, stopped, and one entry.
+    ASSERT_NE(0u, TelvaneStart());
     result = RunTelvane(L"-r");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    EXPECT_EQ(1u, GroupEntries());
+    EXPECT_EQ(1, GroupEntries());
     SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(testsupport::ServiceQueryStatus(c_wszTelvane, &status));
+    ASSERT_TRUE(ServiceQueryStatus(c_wszTelvane, &status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), status.dwCurrentState);
 
-    result = RunTelvane(L"-u");
+    // Unregistering takes precedence over registering, and takes the group's value with it.
+    result = RunTelvane(L"-r -u");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    EXPECT_FALSE(testsupport::ServiceExists(c_wszTelvane));
-    EXPECT_FALSE(GroupValueExists());
+    EXPECT_FALSE(ServiceExists(c_wszTelvane));
+    EXPECT_EQ(-1, GroupEntries());
     // Removing what is not installed is not an error.
     EXPECT_EQ(0u, RunTelvane(L"-u").dwExitCode);
     EXPECT_EQ(0u, RunTelvane(L"Telvane /u").dwExitCode);
 }
 
-TEST_F(TelvaneInstall, UnregisterTakesPrecedenceOverRegister)
+TEST_F(TelvaneScm, RunsUnderTelvaneHostWithItsStopCallback)
 {
     ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
-    ASSERT_TRUE(testsupport::ServiceExists(c_wszTelvane));
-    ASSERT_EQ(0u, RunTelvane(L"-r -u").dwExitCode);
-    EXPECT_FALSE(testsupport::ServiceExists(c_wszTelvane));
-    EXPECT_FALSE(GroupValueExists());
-}
-
-TEST_F(TelvaneInstall, RunsUnderTelvaneHostWithItsStopCallback)
-{
-    ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
-    ASSERT_TRUE(testsupport::ServiceSetImagePath(c_wszTelvane, L"\"" + testsupport::BinDir() +
-                                                        L"telvanehost.exe\" -k OVTCBNetwork"));
+    ASSERT_TRUE(
+        ServiceSetImagePath(c_wszTelvane, BinCommand(L"telvanehost.exe") + L" -k OVTCBNetwork"));
     // Only the stop callback runs OnStop under this host: without it STOPPED never comes.
     StartAndStop(L"telvanehost.exe");
     // And the next start gets a fresh host.
@@ -165,12 +144,11 @@ TEST_F(TelvaneInstall, RunsUnderTelvaneHostWithItsStopCallback)
 
     // Here a STOP returns while the service still runs: registering again must see the old
     // installation down before it creates the new one.
-    ASSERT_EQ(0u, testsupport::ServiceStart(c_wszTelvane, {}));
-    ASSERT_TRUE(testsupport::ServiceWaitForState(c_wszTelvane, SERVICE_RUNNING, c_dwStateWaitMs));
-    testsupport::ChildResult result = RunTelvane(L"-r");
+    ASSERT_NE(0u, TelvaneStart());
+    ChildResult result = RunTelvane(L"-r");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    testsupport::SERVICE_RECORD record;
-    ASSERT_TRUE(testsupport::ServiceReadRecord(c_wszTelvane, &record));
+    SERVICE_RECORD record;
+    ASSERT_TRUE(ServiceReadRecord(c_wszTelvane, &record));
     EXPECT_EQ(L"svchost.exe -k OVTCBNetwork", record.wstrBinaryPath);
-    EXPECT_EQ(1u, GroupEntries());
+    EXPECT_EQ(1, GroupEntries());
 }

@@ -1,6 +1,7 @@
 // The service shell in-process: command lines, the service list, status reports, control
 // requests, the stop callback and console mode. What reaches the control manager is seen
 // through the status seam, since a status handle exists only inside a service process.
+#include "inc/handleholder.h"
 #include "servicelib/diagnostics.h"
 #include "tests/common/testsupport.h"
 #include "tests/service/testservice.h"
@@ -8,6 +9,7 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <mutex>
 #include <thread>
 #include <vector>
@@ -43,6 +45,8 @@ std::vector<REPORT> Reports()
     return s_rgReports;
 }
 
+// Every test starts with an empty service list and records what would reach the control
+// manager; services are the test's locals, driven from the test thread.
 class ServiceShell : public ::testing::Test
 {
 protected:
@@ -121,7 +125,6 @@ TEST_F(ServiceShell, ParseCommandLineTable)
 
 TEST_F(ServiceShell, ListHandsOutBitsAndUnlinksOnDestruction)
 {
-    LogCapture log;
     CTestService first(L"First");
     CTestService second(L"Second");
     CTestService *pThird = new CTestService(L"Third");
@@ -137,21 +140,11 @@ TEST_F(ServiceShell, ListHandsOutBitsAndUnlinksOnDestruction)
     delete pThird;
     EXPECT_EQ(&second, CTestService::FirstService());
     EXPECT_EQ(&first, second.m_pNextService);
-
-    wchar_t wszExpected[128];
-    StringCchPrintf(wszExpected, 128, L"Successfully Unregistered CService=%p\r\n",
-                    static_cast<CService *>(&second));
     second.UnregisterService();
-    EXPECT_TRUE(log.Contains(wszExpected));
     EXPECT_EQ(&first, CTestService::FirstService());
-
-    // A service not in the list is left alone, with the first line only.
+    // A service not in the list leaves the list alone.
     CTestService stray(L"Stray");
-    size_t cLines = log.Lines().size();
     stray.UnregisterService();
-    ASSERT_EQ(cLines + 1, log.Lines().size());
-    EXPECT_NE(std::wstring::npos,
-              log.Lines().back().find(L"CService::UnregisterService: Attempting to Unregister"));
     EXPECT_EQ(&first, CTestService::FirstService());
 
     // Listing a service twice is refused without making the list a cycle.
@@ -201,11 +194,16 @@ TEST_F(ServiceShell, SetStatusCheckPointsAndNothingAfterStopped)
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
 }
 
+// Each control reaches its handler (the defaults assert that a service accepting it must
+// override them) and is answered with the current status; a user-defined control reaches only
+// a service that takes them, but is answered all the same: any client with the right can send
+// one. Without a host, STOP runs OnStop in the handler.
 TEST_F(ServiceShell, ControlHandlerDispatchesAndReportsAgain)
 {
     CRecordingService service(L"Controlled");
-    service.m_fAcceptControl = true;
+    CTestService plain(L"Plain");
     CService::RegisterService(&service);
+    CService::RegisterService(&plain);
     service.m_hServiceStatus = c_hFakeStatus;
     service.SetStatus(SERVICE_RUNNING);
     int iData = 0;
@@ -214,82 +212,47 @@ TEST_F(ServiceShell, ControlHandlerDispatchesAndReportsAgain)
     {
         DWORD dwControl;
         DWORD dwEventType;
-        const wchar_t *wszExpected;
+        const wchar_t *wszRecorded; // by the recording service
+        const wchar_t *wszDefault;  // the default handler, which asserts
     } rgCases[] = {
-        {SERVICE_CONTROL_PAUSE, 0, L"Pause"},
-        {SERVICE_CONTROL_CONTINUE, 0, L"Continue"},
-        {SERVICE_CONTROL_SHUTDOWN, 0, L"Shutdown"},
-        {SERVICE_CONTROL_DEVICEEVENT, 0x8000, L"DeviceEvent 32768"},
-        {SERVICE_CONTROL_POWEREVENT, 10, L"PowerEvent 10"},
-        {128, 0, L"Control 128"},
-        {255, 0, L"Control 255"},
-        {SERVICE_CONTROL_INTERROGATE, 0, L""},
-        {256, 0, L""},
-        {127, 0, L""},
+        {SERVICE_CONTROL_PAUSE, 0, L"Pause", L"OnPause"},
+        {SERVICE_CONTROL_CONTINUE, 0, L"Continue", L"OnContinue"},
+        {SERVICE_CONTROL_SHUTDOWN, 0, L"Shutdown", L"OnShutdown"},
+        {SERVICE_CONTROL_DEVICEEVENT, 0x8000, L"DeviceEvent 32768", L"OnDeviceEvent"},
+        {SERVICE_CONTROL_POWEREVENT, 10, L"PowerEvent 10", L"OnPowerEvent"},
+        {128, 0, L"Control 128", L"OnControl"},
+        {255, 0, L"Control 255", L"OnControl"},
+        {SERVICE_CONTROL_INTERROGATE, 0, L"", nullptr},
+        {256, 0, L"", nullptr},
+        {127, 0, L"", nullptr},
     };
-    for (const auto &testCase : rgCases)
+    for (bool fAcceptControl : {true, false})
     {
-        service.m_wstrLast.clear();
-        size_t cReports = Reports().size();
-        EXPECT_EQ(static_cast<DWORD>(NO_ERROR),
-                  CService::ServiceControlHandler(testCase.dwControl, testCase.dwEventType, &iData,
-                                                  &service));
-        EXPECT_EQ(testCase.wszExpected, service.m_wstrLast) << testCase.dwControl;
-        // Every control is answered with the current status again.
-        ASSERT_EQ(cReports + 1, Reports().size()) << testCase.dwControl;
-        EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), Reports().back().dwState);
+        service.m_fAcceptControl = fAcceptControl;
+        plain.m_fAcceptControl = fAcceptControl;
+        for (const auto &testCase : rgCases)
+        {
+            SCOPED_TRACE(testCase.dwControl);
+            bool fUser = testCase.dwControl >= 128 && testCase.dwControl <= 255;
+            service.m_wstrLast.clear();
+            size_t cReports = Reports().size();
+            EXPECT_EQ(static_cast<DWORD>(NO_ERROR),
+                      CService::ServiceControlHandler(testCase.dwControl, testCase.dwEventType,
+                                                      &iData, &service));
+            EXPECT_EQ(fUser && !fAcceptControl ? L"" : testCase.wszRecorded, service.m_wstrLast);
+            ASSERT_EQ(cReports + 1, Reports().size());
+            EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), Reports().back().dwState);
+
+            FailureCapture failures;
+            CService::ServiceControlHandler(testCase.dwControl, 0, nullptr, &plain);
+            bool fAsserts = testCase.wszDefault != nullptr && (!fUser || fAcceptControl);
+            ASSERT_EQ(fAsserts ? 1u : 0u, failures.Count());
+            EXPECT_TRUE(!fAsserts || failures.Contains(std::wstring(L"you MUST override ") +
+                                                       testCase.wszDefault + L"\""));
+        }
     }
     EXPECT_EQ(&iData, service.m_pvLastData);
-
-    // A user-defined control reaches only a service that takes them, but is answered all the
-    // same: any client with the right can send one.
-    service.m_fAcceptControl = false;
-    service.m_wstrLast.clear();
-    size_t cReports = Reports().size();
-    CService::ServiceControlHandler(200, 0, &iData, &service);
-    EXPECT_EQ(L"", service.m_wstrLast);
-    EXPECT_EQ(cReports + 1, Reports().size());
     EXPECT_EQ(0, service.m_cStops);
-}
-
-TEST_F(ServiceShell, DefaultHandlersAssert)
-{
-    FailureCapture failures;
-    CTestService service(L"Plain");
-    CService::RegisterService(&service);
-    // Nobody asked for user-defined controls: one that arrives anyway is no fault.
-    CService::ServiceControlHandler(200, 0, nullptr, &service);
-    EXPECT_EQ(0u, failures.Count());
-
-    service.m_fAcceptControl = true;
-    DWORD rgControls[] = {SERVICE_CONTROL_PAUSE,      SERVICE_CONTROL_CONTINUE,
-                          SERVICE_CONTROL_SHUTDOWN,   SERVICE_CONTROL_DEVICEEVENT,
-                          SERVICE_CONTROL_POWEREVENT, 200};
-    for (DWORD dwControl : rgControls)
-    {
-        CService::ServiceControlHandler(dwControl, 0, nullptr, &service);
-    }
-    ASSERT_EQ(6u, failures.Count());
-    const wchar_t *rgHandlers[][2] = {
-        {L"m_fAcceptPauseContinue", L"OnPause"},    {L"m_fAcceptPauseContinue", L"OnContinue"},
-        {L"m_fAcceptShutdown", L"OnShutdown"},      {L"m_fAcceptDeviceEvents", L"OnDeviceEvent"},
-        {L"m_fAcceptPowerEvents", L"OnPowerEvent"}, {L"m_fAcceptControl", L"OnControl"},
-    };
-    for (const auto &handler : rgHandlers)
-    {
-        std::wstring wstrExpected = std::wstring(L"Assertion failure: false && \"When ") +
-                                    handler[0] + L" is true, you MUST override " + handler[1] +
-                                    L"\"";
-        EXPECT_TRUE(failures.Contains(wstrExpected)) << testsupport::Narrow(wstrExpected);
-    }
-}
-
-TEST_F(ServiceShell, StopWithoutHostRunsOnStopInTheHandler)
-{
-    CTestService service(L"Direct");
-    CService::RegisterService(&service);
-    service.m_hServiceStatus = c_hFakeStatus;
-    service.SetStatus(SERVICE_RUNNING);
 
     CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
     EXPECT_EQ(1, service.m_cStops);
@@ -319,34 +282,25 @@ DWORD RunAsHosted(CTestService &service, SVCHOST_GLOBAL_DATA &globals)
 
 namespace
 {
-// A manual-reset event closed when the test ends.
-class CManualEvent
+HANDLE NewManualEvent()
 {
-public:
-    CManualEvent()
-        : m_hEvent(CreateEventW(nullptr, TRUE, FALSE, nullptr))
-    {
-    }
-    ~CManualEvent() { CloseHandle(m_hEvent); }
-    CManualEvent(const CManualEvent &) = delete;
-    CManualEvent &operator=(const CManualEvent &) = delete;
-    HANDLE Get() const { return m_hEvent; }
+    return CreateEventW(nullptr, TRUE, FALSE, nullptr);
+}
 
-private:
-    HANDLE m_hEvent;
-};
-
-// Lets a held stop callback finish and waits for it when the test ends, however it ends.
+// Lets a held stop callback (on the host's callback thread) finish and waits for it when the
+// test ends, however it ends. Owned by the test.
 class CCallbacksDone
 {
 public:
-    explicit CCallbacksDone(HANDLE hRelease)
+    CCallbacksDone(HANDLE hRelease, HANDLE hFinish)
         : m_hRelease(hRelease)
+        , m_hFinish(hFinish)
     {
     }
     ~CCallbacksDone()
     {
         SetEvent(m_hRelease);
+        SetEvent(m_hFinish);
         HostWaitForStopCallbacks(c_dwWaitMs);
     }
     CCallbacksDone(const CCallbacksDone &) = delete;
@@ -354,70 +308,48 @@ public:
 
 private:
     HANDLE m_hRelease;
+    HANDLE m_hFinish;
 };
 } // namespace
 
-// The stop event and the host's stop callback, then STOP through the handler.
+// Under a host, STOP only signals the stop event: the handler returns with RUNNING reported
+// while OnStop runs on the host's stop-callback thread. A host that serves other services too
+// keeps its process after STOPPED and may start the service again at once, on another thread,
+// while the first run's callback is still finishing: that callback must drop only its own wait
+// and event, not the new run's. A STOP after the last callback finds nothing to stop.
 TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
 {
     FailureCapture failures;
     SVCHOST_GLOBAL_DATA globals = {};
     CTestService service(L"Hosted");
-    service.m_hStopEntered = CreateEventW(nullptr, TRUE, FALSE, nullptr);
-    service.m_hStopRelease = CreateEventW(nullptr, TRUE, FALSE, nullptr);
+    // Declared after the service: however the test ends, no callback outlives it.
+    CKernelHandle stopEntered(NewManualEvent());
+    CKernelHandle stopRelease(NewManualEvent());
+    CKernelHandle stoppedReported(NewManualEvent());
+    CKernelHandle stopFinish(NewManualEvent());
+    CKernelHandle startDone(NewManualEvent());
+    CCallbacksDone callbacksDone(stopRelease.Get(), stopFinish.Get());
+    service.m_hStopEntered = stopEntered.Get();
+    service.m_hStopRelease = stopRelease.Get();
+    service.m_hStoppedReported = stoppedReported.Get();
+    service.m_hStopFinish = stopFinish.Get();
+    service.m_hStartDone = startDone.Get();
     ASSERT_EQ(0u, RunAsHosted(service, globals));
     EXPECT_EQ(&globals, CTestService::Globals());
     EXPECT_TRUE(CTestService::Svchost());
     EXPECT_STREQ(L"TestGroup", CTestService::Group());
 
-    // The handler only signals: it returns with RUNNING reported while OnStop still runs.
     CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
-    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(service.m_hStopEntered, c_dwWaitMs));
+    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(stopEntered.Get(), c_dwWaitMs));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), Reports().back().dwState);
     EXPECT_NE(GetCurrentThreadId(), service.m_dwStopThread);
-
-    SetEvent(service.m_hStopRelease);
-    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
-    EXPECT_EQ(1, service.m_cStops);
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), Reports().back().dwState);
-    EXPECT_EQ(nullptr, service.m_hStopEvent);
-    EXPECT_EQ(nullptr, service.m_hStopWait);
-
-    // A STOP that arrives after the callback finds nothing to stop: no second OnStop, no
-    // SetEvent on the closed event.
-    size_t cReports = Reports().size();
-    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
-    EXPECT_EQ(1, service.m_cStops);
-    EXPECT_EQ(cReports, Reports().size());
-    EXPECT_EQ(0u, failures.Count());
-    CloseHandle(service.m_hStopEntered);
-    CloseHandle(service.m_hStopRelease);
-}
-
-// A host that serves other services too keeps its process after STOPPED and may start the
-// service again at once, on another thread, while the stop callback of the first run is still
-// finishing. That callback must drop only its own wait and event, not the new run's.
-TEST_F(ServiceShell, StopCallbackLeavesTheNextStartAlone)
-{
-    FailureCapture failures;
-    SVCHOST_GLOBAL_DATA globals = {};
-    CTestService service(L"Restarted");
-    // Declared after the service: however the test ends, no callback outlives it.
-    CManualEvent stoppedReported;
-    CManualEvent stopFinish;
-    CManualEvent startDone;
-    CCallbacksDone callbacksDone(stopFinish.Get());
-    service.m_hStoppedReported = stoppedReported.Get();
-    service.m_hStopFinish = stopFinish.Get();
-    service.m_hStartDone = startDone.Get();
-    ASSERT_EQ(0u, RunAsHosted(service, globals));
-
-    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    SetEvent(stopRelease.Get());
     ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(stoppedReported.Get(), c_dwWaitMs));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), Reports().back().dwState);
 
     // The next start, through ServiceMain itself (outside a service process the control
     // handler cannot be registered: that fatal error is expected here).
-    wchar_t wszName[] = L"Restarted";
+    wchar_t wszName[] = L"Hosted";
     LPWSTR rgArgv[] = {wszName};
     service.ServiceMain(1, rgArgv);
     ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(startDone.Get(), c_dwWaitMs));
@@ -431,14 +363,16 @@ TEST_F(ServiceShell, StopCallbackLeavesTheNextStartAlone)
     EXPECT_EQ(hNewStopEvent, service.m_hStopEvent);
     EXPECT_EQ(hNewStopWait, service.m_hStopWait);
 
-    // And the new run stops through its own event and callback.
+    // The new run stops through its own event and callback.
     ResetEvent(stoppedReported.Get());
     CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
     EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(stoppedReported.Get(), c_dwWaitMs));
     ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
-    EXPECT_EQ(2, service.m_cStops);
     EXPECT_EQ(nullptr, service.m_hStopEvent);
     EXPECT_EQ(nullptr, service.m_hStopWait);
+    // No third OnStop, and no SetEvent on the closed event.
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    EXPECT_EQ(2, service.m_cStops);
     EXPECT_EQ(1u, failures.Count());
     EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
 }
@@ -531,6 +465,41 @@ TEST_F(ServiceShell, HostEntryPointsListTheServiceOnce)
     EXPECT_EQ(0u, failures.Count());
 }
 
+namespace
+{
+// Console mode on a thread of its own, let go with Ctrl+C when the test ends however it ends.
+class CConsoleThread
+{
+public:
+    explicit CConsoleThread(ULONG ulFlags)
+        : m_thread([this, ulFlags] {
+            m_dwThread = GetCurrentThreadId();
+            CService::RunAsConsoleExe(ulFlags);
+            m_fDone = true;
+        })
+    {
+    }
+    ~CConsoleThread()
+    {
+        if (!m_fDone)
+        {
+            CService::ConsoleCtrlHandler(CTRL_C_EVENT);
+        }
+        m_thread.join();
+    }
+    bool WaitDone(DWORD dwTimeoutMs = c_dwWaitMs)
+    {
+        return testsupport::WaitUntil([&] { return m_fDone.load(); }, dwTimeoutMs);
+    }
+
+    std::atomic<bool> m_fDone{false};
+    std::atomic<DWORD> m_dwThread{0};
+
+private:
+    std::thread m_thread;
+};
+} // namespace
+
 TEST_F(ServiceShell, ConsoleModeEndsWhenTheSelectedServicesStopThemselves)
 {
     // Only the first is selected; the other never starts and must not keep console mode up.
@@ -538,22 +507,10 @@ TEST_F(ServiceShell, ConsoleModeEndsWhenTheSelectedServicesStopThemselves)
     CTestService bystander(L"Bystander");
     CService::RegisterService(&quitter);
     CService::RegisterService(&bystander);
-
-    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
-    ULONG ulFlags = quitter.m_ulServiceBit;
-    std::thread console([&] {
-        CService::RunAsConsoleExe(ulFlags);
-        SetEvent(hDone);
-    });
-    DWORD dwWait = WaitForSingleObject(hDone, c_dwWaitMs);
-    if (dwWait != WAIT_OBJECT_0)
     {
-        // Let the console thread go before failing.
-        CService::ConsoleCtrlHandler(CTRL_C_EVENT);
+        CConsoleThread console(quitter.m_ulServiceBit);
+        EXPECT_TRUE(console.WaitDone());
     }
-    console.join();
-    CloseHandle(hDone);
-    EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
     EXPECT_EQ(1, quitter.m_cStarts);
     EXPECT_EQ(0, quitter.m_cStops);
     EXPECT_EQ(0, bystander.m_cStarts);
@@ -569,31 +526,18 @@ TEST_F(ServiceShell, ConsoleModeStopsRunningServicesOnCtrlC)
     CTestService quitter(L"Quitter", CTestService::StartMode::StopItself);
     CService::RegisterService(&runner);
     CService::RegisterService(&quitter);
-
-    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
-    DWORD dwConsoleThread = 0;
-    std::thread console([&] {
-        dwConsoleThread = GetCurrentThreadId();
-        CService::RunAsConsoleExe(CService::c_ulServiceMask);
-        SetEvent(hDone);
-    });
-    // One service stopping by itself is not the end while another runs.
-    for (int i = 0; i < 1000 && runner.m_status.dwCurrentState != SERVICE_RUNNING; i++)
     {
-        Sleep(10);
+        CConsoleThread console(CService::c_ulServiceMask);
+        // One service stopping by itself is not the end while another runs.
+        ASSERT_TRUE(testsupport::WaitUntil(
+            [&] { return runner.m_status.dwCurrentState == SERVICE_RUNNING; }));
+        EXPECT_FALSE(console.WaitDone(200));
+        EXPECT_TRUE(CService::ConsoleCtrlHandler(CTRL_C_EVENT));
+        ASSERT_TRUE(console.WaitDone());
+        EXPECT_EQ(console.m_dwThread, runner.m_dwStopThread);
     }
-    ASSERT_EQ(static_cast<DWORD>(SERVICE_RUNNING), runner.m_status.dwCurrentState);
-    EXPECT_EQ(static_cast<DWORD>(WAIT_TIMEOUT), WaitForSingleObject(hDone, 200));
-
-    EXPECT_TRUE(CService::ConsoleCtrlHandler(CTRL_C_EVENT));
-    DWORD dwWait = WaitForSingleObject(hDone, c_dwWaitMs);
-    console.join();
-    CloseHandle(hDone);
-    ASSERT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
     EXPECT_EQ(1, runner.m_cStops);
-    EXPECT_EQ(dwConsoleThread, runner.m_dwStopThread);
     EXPECT_EQ(0, quitter.m_cStops);
-
     // A late Ctrl+C after console mode closed its event is harmless.
     EXPECT_TRUE(CService::ConsoleCtrlHandler(CTRL_C_EVENT));
     EXPECT_EQ(0u, failures.Count());

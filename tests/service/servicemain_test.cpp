@@ -1,23 +1,22 @@
 // The shell's ServiceMain under the prefix's real control manager, in a test service of its
-// own (servicetest_child.exe) or in telvanehost.exe, under test-only names.
+// own (servicetest_child.exe) or in telvanehost.exe (servicetest.dll, or telvane.dll under a
+// name it does not serve), under test-only names.
 #include "servicelib/reghelper.h"
 #include "servicelib/service.h"
-#include "tests/common/testsupport.h"
 #include "tests/common/scmtest.h"
 #include "tests/service/testservice.h"
 
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <thread>
 
-using testsupport::FailureCapture;
+using namespace testsupport;
 
 namespace
 {
-const DWORD c_dwStateWaitMs = 30000;
-
-// The release event of a "hold-stop" service (see childservice.h), signalled and closed however the
-// test ends so that the service can stop before the test removes it.
+// The release event of a "hold-stop" service (see childservice.h), signalled and closed however
+// the test ends so that the service can stop before the test removes it. Test thread only.
 class CReleaseOnExit
 {
 public:
@@ -42,58 +41,59 @@ private:
     HANDLE m_hEvent;
 };
 
-std::wstring Quoted(const std::wstring &wstrPath)
-{
-    return L"\"" + wstrPath + L"\"";
-}
-
-// A test-only own-process service running servicetest_child.exe, deleted again at the end.
-class CChildServiceHolder
+// A test-only service, deleted again at the end: servicetest_child.exe in a process of its own,
+// or the DLL given run by telvanehost.exe alone in a test-only group. Test thread only.
+class CTestServiceHolder
 {
 public:
-    CChildServiceHolder()
-        : m_wstrName(testsupport::UniqueName(L"TelvaneTestChild"))
+    explicit CTestServiceHolder(const wchar_t *wszDll = nullptr)
+        : m_wstrName(UniqueName(wszDll == nullptr ? L"TelvaneTestChild" : L"TelvaneTestHosted"))
+        , m_wstrGroup(UniqueName(L"TelvaneTestGroup"))
         , m_cleanup(m_wstrName)
     {
-        m_fCreated = testsupport::ServiceCreateOwnProcess(
-            m_wstrName.c_str(), Quoted(testsupport::BinDir() + L"servicetest_child.exe"));
+        if (wszDll == nullptr)
+        {
+            m_fCreated = ServiceCreateOwnProcess(Name(), BinCommand(L"servicetest_child.exe"));
+            return;
+        }
+        m_fCreated =
+            ServiceCreateOwnProcess(Name(), BinCommand(L"telvanehost.exe") + L" -k " + m_wstrGroup);
+        // Without the service, its key would stay behind with these values.
+        if (m_fCreated)
+        {
+            std::wstring wstrParameters =
+                L"SYSTEM\\CurrentControlSet\\Services\\" + m_wstrName + L"\\Parameters";
+            RegHelperSetString(wstrParameters.c_str(), L"ServiceDll", BinDir() + wszDll,
+                               REG_EXPAND_SZ);
+            RegHelperSetMultiString(c_wszSvchostGroupKey, m_wstrGroup.c_str(), {m_wstrName});
+        }
     }
+    ~CTestServiceHolder() { RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str()); }
     const wchar_t *Name() const { return m_wstrName.c_str(); }
     bool Created() const { return m_fCreated; }
 
-    // Starts the service under host globals with OnStop held until the release event, and
-    // sends STOP; the status the control returned goes to *pStatus.
-    ::testing::AssertionResult StartAndHoldStop(SERVICE_STATUS *pStatus)
+    // Starts with the parameters and waits for RUNNING; the service's process id, or 0.
+    DWORD StartRunning(const std::vector<std::wstring> &rgArgs)
     {
-        DWORD dwError = testsupport::ServiceStart(Name(), {L"host", L"hold-stop"});
-        if (dwError != ERROR_SUCCESS)
-        {
-            return ::testing::AssertionFailure() << "StartService: " << dwError;
-        }
-        if (!testsupport::ServiceWaitForState(Name(), SERVICE_RUNNING, c_dwStateWaitMs))
-        {
-            return ::testing::AssertionFailure() << "never RUNNING";
-        }
-        dwError = testsupport::ServiceControl(Name(), SERVICE_CONTROL_STOP, pStatus);
-        if (dwError != ERROR_SUCCESS)
-        {
-            return ::testing::AssertionFailure() << "STOP: " << dwError;
-        }
-        return ::testing::AssertionSuccess();
+        SERVICE_STATUS_PROCESS status = {};
+        EXPECT_EQ(0u, ServiceStart(Name(), rgArgs));
+        EXPECT_TRUE(ServiceWaitForState(Name(), SERVICE_RUNNING, c_dwWaitMs, &status))
+            << status.dwCurrentState;
+        return status.dwCurrentState == SERVICE_RUNNING ? status.dwProcessId : 0;
     }
 
 private:
     std::wstring m_wstrName;
-    testsupport::CServiceCleanup m_cleanup;
-    bool m_fCreated;
+    std::wstring m_wstrGroup;
+    CServiceCleanup m_cleanup;
+    bool m_fCreated = false;
 };
 } // namespace
 
 TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
 {
-    CChildServiceHolder child;
+    CTestServiceHolder child;
     ASSERT_TRUE(child.Created());
-
     struct
     {
         std::vector<std::wstring> rgArgs;
@@ -105,10 +105,10 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
     };
     for (const auto &testCase : rgCases)
     {
-        ASSERT_EQ(0u, testsupport::ServiceStart(child.Name(), testCase.rgArgs));
+        SCOPED_TRACE(testCase.rgArgs.size());
+        ASSERT_EQ(0u, ServiceStart(child.Name(), testCase.rgArgs));
         SERVICE_STATUS_PROCESS status = {};
-        ASSERT_TRUE(
-            testsupport::ServiceWaitForState(child.Name(), SERVICE_START_PENDING, c_dwStateWaitMs, &status))
+        ASSERT_TRUE(ServiceWaitForState(child.Name(), SERVICE_START_PENDING, c_dwWaitMs, &status))
             << status.dwCurrentState;
         EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), status.dwServiceType);
         EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP), status.dwControlsAccepted);
@@ -116,8 +116,8 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
         EXPECT_EQ(testCase.dwWaitHint, status.dwWaitHint);
 
         // Without a host, STOP runs OnStop in the handler, even before RUNNING.
-        EXPECT_EQ(0u, testsupport::ServiceStop(child.Name()));
-        ASSERT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
+        EXPECT_EQ(0u, ServiceStop(child.Name()));
+        ASSERT_TRUE(ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwWaitMs, &status));
         // The child reports the breakpoints it saw after START_PENDING.
         EXPECT_EQ(static_cast<DWORD>(ERROR_SERVICE_SPECIFIC_ERROR), status.dwWin32ExitCode);
         EXPECT_EQ(testCase.dwBreakpoints, status.dwServiceSpecificExitCode);
@@ -129,155 +129,86 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
 // asked for must leave it running: here the default OnControl would end the process.
 TEST(ServiceMainUnderScm, UserControlNobodyAskedForLeavesTheServiceRunning)
 {
-    CChildServiceHolder child;
+    CTestServiceHolder child;
     ASSERT_TRUE(child.Created());
-    ASSERT_EQ(0u, testsupport::ServiceStart(child.Name(), {}));
-    SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
-    testsupport::CServiceProcess process(status.dwProcessId);
+    CServiceProcess process(child.StartRunning({}));
     ASSERT_TRUE(process.Opened());
 
     SERVICE_STATUS statusControl = {};
-    EXPECT_EQ(0u, testsupport::ServiceControl(child.Name(), 200, &statusControl));
+    EXPECT_EQ(0u, ServiceControl(child.Name(), 200, &statusControl));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
 
     // Still alive: it stops as usual, with no breakpoint seen, and its process leaves cleanly.
-    if (testsupport::ServiceStop(child.Name()) == ERROR_SUCCESS)
-    {
-        EXPECT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
-        EXPECT_EQ(0u, status.dwServiceSpecificExitCode);
-    }
-    DWORD dwExitCode = process.WaitForExitCode(c_dwStateWaitMs);
+    SERVICE_STATUS_PROCESS status = {};
+    EXPECT_EQ(0u, ServiceStop(child.Name()));
+    EXPECT_TRUE(ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwWaitMs, &status));
+    EXPECT_EQ(0u, status.dwServiceSpecificExitCode);
+    DWORD dwExitCode = process.WaitForExitCode(c_dwWaitMs);
     EXPECT_EQ(0u, dwExitCode) << std::hex << dwExitCode;
 }
-
-TEST(ServiceMainUnderScm, StopUnderHostReturnsAtOnceAndStopsWhenOnStopEnds)
-{
-    CChildServiceHolder child;
-    ASSERT_TRUE(child.Created());
-    CReleaseOnExit release(child.Name());
-    ASSERT_NE(nullptr, release.Get());
-
-    // The handler only signals the stop event: the control returns with RUNNING, and the
-    // service stays RUNNING while OnStop works on the host's stop-callback thread.
-    SERVICE_STATUS status = {};
-    ASSERT_TRUE(child.StartAndHoldStop(&status));
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
-    SERVICE_STATUS_PROCESS statusNow = {};
-    ASSERT_TRUE(testsupport::ServiceQueryStatus(child.Name(), &statusNow));
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusNow.dwCurrentState);
-
-    SetEvent(release.Get());
-    EXPECT_TRUE(testsupport::ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
-}
-
-// Someone deleted the service while it was stopping (sc stop, sc delete): the record stays,
-// marked for deletion, until the service is down. Unregistering it then is no error: the
-// stopping service cannot take another STOP (1061) and is already marked (1072).
-TEST(ServiceMainUnderScm, UnregisterOfAStoppingServiceMarkedForDeletion)
-{
-    FailureCapture failures;
-    CChildServiceHolder child;
-    ASSERT_TRUE(child.Created());
-    CReleaseOnExit release(child.Name());
-    ASSERT_NE(nullptr, release.Get());
-
-    // Stopping (OnStop holds until released), then deleted.
-    ASSERT_TRUE(child.StartAndHoldStop(nullptr));
-    ASSERT_TRUE(testsupport::ServiceDelete(child.Name()));
-
-    CTestService service(child.Name());
-    CService::RegisterService(&service);
-    HANDLE hDone = CreateEventW(nullptr, TRUE, FALSE, nullptr);
-    std::thread unregister([&] {
-        service.UnregisterOneService();
-        SetEvent(hDone);
-    });
-    // Where the record lasts until the service is down (Windows), unregistering waits for
-    // it: let the service go after a while. Wine drops the record at once.
-    WaitForSingleObject(hDone, 1000);
-    SetEvent(release.Get());
-    DWORD dwWait = WaitForSingleObject(hDone, c_dwStateWaitMs);
-    unregister.join();
-    CloseHandle(hDone);
-    EXPECT_EQ(static_cast<DWORD>(WAIT_OBJECT_0), dwWait);
-    EXPECT_EQ(0u, failures.Count());
-    EXPECT_FALSE(testsupport::ServiceExists(child.Name()));
-    EXPECT_EQ(1, service.m_cUnregisters);
-}
-
-namespace
-{
-// A test-only service run by telvanehost.exe from the DLL given, alone in a test-only group.
-class CHostedServiceHolder
-{
-public:
-    explicit CHostedServiceHolder(const wchar_t *wszDll)
-        : m_wstrName(testsupport::UniqueName(L"TelvaneTestHosted"))
-        , m_wstrGroup(testsupport::UniqueName(L"TelvaneTestGroup"))
-        , m_cleanup(m_wstrName)
-    {
-        m_fCreated = testsupport::ServiceCreateOwnProcess(m_wstrName.c_str(),
-                                               Quoted(testsupport::BinDir() + L"telvanehost.exe") +
-                                                   L" -k " + m_wstrGroup);
-        // Without the service, its key would stay behind with these values.
-        if (!m_fCreated)
-        {
-            return;
-        }
-        std::wstring wstrParameters =
-            L"SYSTEM\\CurrentControlSet\\Services\\" + m_wstrName + L"\\Parameters";
-        RegHelperSetString(wstrParameters.c_str(), L"ServiceDll", testsupport::BinDir() + wszDll,
-                           REG_EXPAND_SZ);
-        RegHelperSetMultiString(c_wszSvchostGroupKey, m_wstrGroup.c_str(), {m_wstrName});
-    }
-    ~CHostedServiceHolder() { RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str()); }
-    const wchar_t *Name() const { return m_wstrName.c_str(); }
-    bool Created() const { return m_fCreated; }
-
-private:
-    std::wstring m_wstrName;
-    std::wstring m_wstrGroup;
-    testsupport::CServiceCleanup m_cleanup;
-    bool m_fCreated;
-};
-} // namespace
 
 // Under telvanehost a STOP reaches OnStop through the host's stop callback: the control
 // returns at once with RUNNING while OnStop still works, and the host leaves after STOPPED.
 TEST(TelvaneHost, StopGoesThroughTheHostStopCallback)
 {
-    CHostedServiceHolder hosted(L"servicetest.dll");
+    CTestServiceHolder hosted(L"servicetest.dll");
     ASSERT_TRUE(hosted.Created());
     CReleaseOnExit release(hosted.Name());
     ASSERT_NE(nullptr, release.Get());
-
-    ASSERT_EQ(0u, testsupport::ServiceStart(hosted.Name(), {L"hold-stop"}));
-    SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs, &status));
-    testsupport::CServiceProcess host(status.dwProcessId);
+    CServiceProcess host(hosted.StartRunning({L"hold-stop"}));
     ASSERT_TRUE(host.Opened());
 
     SERVICE_STATUS statusControl = {};
-    EXPECT_EQ(0u, testsupport::ServiceControl(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
+    EXPECT_EQ(0u, ServiceControl(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
-    ASSERT_TRUE(testsupport::ServiceQueryStatus(hosted.Name(), &status));
+    SERVICE_STATUS_PROCESS status = {};
+    ASSERT_TRUE(ServiceQueryStatus(hosted.Name(), &status));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
 
     SetEvent(release.Get());
-    EXPECT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs));
-    EXPECT_EQ(0u, host.WaitForExitCode(c_dwStateWaitMs));
+    EXPECT_TRUE(ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwWaitMs));
+    EXPECT_EQ(0u, host.WaitForExitCode(c_dwWaitMs));
+}
+
+// Someone deleted the service while it was stopping (sc stop, sc delete): the record stays,
+// marked for deletion, until the service is down. Unregistering it then is no error: the
+// stopping service cannot take another STOP (1061) and is already marked (1072).
+TEST(TelvaneHost, UnregisterOfAStoppingServiceMarkedForDeletion)
+{
+    FailureCapture failures;
+    CTestServiceHolder hosted(L"servicetest.dll");
+    ASSERT_TRUE(hosted.Created());
+    CReleaseOnExit release(hosted.Name());
+    ASSERT_NE(nullptr, release.Get());
+    ASSERT_NE(0u, hosted.StartRunning({L"hold-stop"}));
+    ASSERT_EQ(0u, ServiceStop(hosted.Name()));
+    ASSERT_TRUE(ServiceDelete(hosted.Name()));
+
+    CTestService service(hosted.Name());
+    CService::RegisterService(&service);
+    std::atomic<bool> fDone{false};
+    std::thread unregister([&] {
+        service.UnregisterOneService();
+        fDone = true;
+    });
+    // Where the record lasts until the service is down (Windows), unregistering waits for
+    // it: let the service go after a while. Wine drops the record at once.
+    WaitUntil([&] { return fDone.load(); }, 1000);
+    SetEvent(release.Get());
+    unregister.join();
+    EXPECT_EQ(0u, failures.Count());
+    EXPECT_FALSE(ServiceExists(hosted.Name()));
+    EXPECT_EQ(1, service.m_cUnregisters);
 }
 
 // A stopped service is deleted only once its host has left; registering the name again
 // must wait for that instead of failing with "marked for delete".
 TEST(TelvaneHost, RegistrationWaitsUntilTheOldServiceIsGone)
 {
-    testsupport::FailureCapture failures;
-    CHostedServiceHolder hosted(L"servicetest.dll");
+    FailureCapture failures;
+    CTestServiceHolder hosted(L"servicetest.dll");
     ASSERT_TRUE(hosted.Created());
-    ASSERT_EQ(0u, testsupport::ServiceStart(hosted.Name(), {L"linger"}));
-    ASSERT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_RUNNING, c_dwStateWaitMs));
+    ASSERT_NE(0u, hosted.StartRunning({L"linger"}));
 
     CTestService service(hosted.Name());
     service.m_idsLocalizedName = 1;
@@ -286,14 +217,14 @@ TEST(TelvaneHost, RegistrationWaitsUntilTheOldServiceIsGone)
     CService::RegisterService(&service);
     service.RegisterOneService();
     EXPECT_EQ(0u, failures.Count());
-    testsupport::SERVICE_RECORD record;
-    ASSERT_TRUE(testsupport::ServiceReadRecord(hosted.Name(), &record));
+    SERVICE_RECORD record;
+    ASSERT_TRUE(ServiceReadRecord(hosted.Name(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_DEMAND_START), record.dwStartType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
 
     // Unregistering returns only once the name is free.
     service.UnregisterOneService();
-    EXPECT_FALSE(testsupport::ServiceExists(hosted.Name()));
+    EXPECT_FALSE(ServiceExists(hosted.Name()));
     EXPECT_EQ(0u, failures.Count());
 }
 
@@ -301,27 +232,25 @@ TEST(TelvaneHost, RegistrationWaitsUntilTheOldServiceIsGone)
 // ERROR_SERVICE_NOT_IN_EXE instead of a start that times out.
 TEST(TelvaneHost, TelvaneDllAnswersAnUnknownNameAtOnce)
 {
-    CHostedServiceHolder hosted(L"telvane.dll");
+    CTestServiceHolder hosted(L"telvane.dll");
     ASSERT_TRUE(hosted.Created());
     // Wine's StartService reports 1053 for a service that stops before it ran; Windows
     // reports success. Either way the status tells why.
-    DWORD dwStart = testsupport::ServiceStart(hosted.Name(), {});
+    DWORD dwStart = ServiceStart(hosted.Name(), {});
     EXPECT_TRUE(dwStart == ERROR_SUCCESS || dwStart == ERROR_SERVICE_REQUEST_TIMEOUT) << dwStart;
     SERVICE_STATUS_PROCESS status = {};
-    EXPECT_TRUE(testsupport::ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwStateWaitMs, &status));
+    EXPECT_TRUE(ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwWaitMs, &status));
     EXPECT_EQ(static_cast<DWORD>(ERROR_SERVICE_NOT_IN_EXE), status.dwWin32ExitCode);
 }
 
 TEST(TelvaneRun, InvalidCommandLinesExitWithThree)
 {
-    std::wstring wstrRunner = Quoted(testsupport::BinDir() + L"telvanerun.exe");
-    const wchar_t *rgArgs[] = {L"Nobody", L"-x", L"Telvane -q", L"-"};
-    for (const wchar_t *wszArgs : rgArgs)
+    for (const wchar_t *wszArgs : {L"Nobody", L"-x", L"Telvane -q", L"-"})
     {
-        testsupport::ChildResult result = testsupport::RunChild(wstrRunner + L" " + wszArgs);
-        EXPECT_FALSE(result.fTimedOut) << testsupport::Narrow(wszArgs);
-        EXPECT_EQ(3u, result.dwExitCode) << testsupport::Narrow(wszArgs) << "\n"
-                                         << result.strOutput;
+        SCOPED_TRACE(Narrow(wszArgs));
+        ChildResult result = RunTelvane(wszArgs);
+        EXPECT_FALSE(result.fTimedOut);
+        EXPECT_EQ(3u, result.dwExitCode) << result.strOutput;
         EXPECT_NE(std::string::npos, result.strOutput.find("Invalid command line"));
     }
 }

@@ -1,9 +1,7 @@
 // An own-process service for the tests that need the shell's ServiceMain under the real
-// control manager (see childservice.h for its start parameters). With the start parameter
-// "host" it first pushes host globals with a real stop callback, as a host would; "-d" is
-// the shell's debug switch, whose breakpoints are counted here instead of ending the process.
+// control manager without a host (see childservice.h for its start parameters). "-d" is the
+// shell's debug switch, whose breakpoints are counted here instead of ending the process.
 #include "tests/service/childservice.h"
-#include "tools/telvanehost/hoststopcallback.h"
 
 namespace
 {
@@ -25,20 +23,11 @@ LONG CALLBACK ChildBreakpointHandler(PEXCEPTION_POINTERS pException)
 }
 
 CChildService s_service;
-SVCHOST_GLOBAL_DATA s_globals = {};
 
 VOID WINAPI ChildServiceMain(DWORD argc, LPWSTR *argv)
 {
     s_service.Configure(argc, argv);
-    if (HasArg(argc, argv, L"host"))
-    {
-        s_globals.RegisterStopCallback = HostRegisterStopCallback;
-        CService::HostPushServiceGlobals(&s_service, L"TelvaneTestGroup", &s_globals);
-    }
-    else
-    {
-        CService::RegisterService(&s_service);
-    }
+    CService::RegisterService(&s_service);
     s_service.ServiceMain(argc, argv);
 }
 } // namespace
@@ -49,10 +38,5 @@ int wmain(int argc, wchar_t **argv)
     // An own-process dispatcher serves whatever name the control manager starts it under.
     wchar_t wszName[] = L"TelvaneTestChild";
     SERVICE_TABLE_ENTRYW rgTable[] = {{wszName, ChildServiceMain}, {nullptr, nullptr}};
-    if (!StartServiceCtrlDispatcherW(rgTable))
-    {
-        return static_cast<int>(GetLastError());
-    }
-    HostWaitForStopCallbacks(c_dwChildReleaseTimeoutMs);
-    return 0;
+    return StartServiceCtrlDispatcherW(rgTable) ? 0 : static_cast<int>(GetLastError());
 }
