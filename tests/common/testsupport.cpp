@@ -130,14 +130,16 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
 {
     ChildResult result;
     SECURITY_ATTRIBUTES sa = {sizeof(sa), nullptr, TRUE};
-    HANDLE hRead = nullptr;
-    HANDLE hWrite = nullptr;
-    if (!CreatePipe(&hRead, &hWrite, &sa, 0))
+    HANDLE hReadEnd = nullptr;
+    HANDLE hWriteEnd = nullptr;
+    if (!CreatePipe(&hReadEnd, &hWriteEnd, &sa, 0))
     {
         result.dwExitCode = GetLastError();
         return result;
     }
-    SetHandleInformation(hRead, HANDLE_FLAG_INHERIT, 0);
+    CKernelHandle read(hReadEnd);
+    CKernelHandle write(hWriteEnd);
+    SetHandleInformation(read.Get(), HANDLE_FLAG_INHERIT, 0);
 
     // Environment block: ours plus the extra entries. A child reads the first entry of a
     // name, so an inherited entry that an extra one names again is left out.
@@ -163,78 +165,64 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
     si.cb = sizeof(si);
     si.dwFlags = STARTF_USESTDHANDLES;
     si.hStdInput = GetStdHandle(STD_INPUT_HANDLE);
-    si.hStdOutput = hWrite;
-    si.hStdError = hWrite;
+    si.hStdOutput = write.Get();
+    si.hStdError = write.Get();
     PROCESS_INFORMATION pi = {};
     std::wstring cmd = wstrCommandLine;
     BOOL fCreated = CreateProcessW(nullptr, &cmd[0], nullptr, nullptr, TRUE,
                                    CREATE_UNICODE_ENVIRONMENT, &block[0], nullptr, &si, &pi);
-    CloseHandle(hWrite);
+    write.Close();
     if (!fCreated)
     {
         result.dwExitCode = GetLastError();
         result.strOutput = "CreateProcess failed: " + std::to_string(result.dwExitCode);
-        CloseHandle(hRead);
         return result;
     }
+    CKernelHandle process(pi.hProcess);
     CloseHandle(pi.hThread);
 
-    // Read until the child (and anything it handed the pipe to) is done.
-    ULONGLONG ullDeadline = GetTickCount64() + dwTimeoutMs;
-    for (;;)
-    {
+    // Reads what is there now; false once the output is closed.
+    auto ReadAvailable = [&] {
         DWORD cbAvail = 0;
-        if (!PeekNamedPipe(hRead, nullptr, 0, nullptr, &cbAvail, nullptr))
-        {
-            // The output is closed, but the process may still be running: its exit code is
-            // only known once it has ended.
-            ULONGLONG ullNow = GetTickCount64();
-            DWORD dwLeft = ullNow < ullDeadline ? static_cast<DWORD>(ullDeadline - ullNow) : 0;
-            if (WaitForSingleObject(pi.hProcess, dwLeft) != WAIT_OBJECT_0)
-            {
-                result.fTimedOut = true;
-                TerminateProcess(pi.hProcess, 1);
-                WaitForSingleObject(pi.hProcess, 5000);
-            }
-            break;
-        }
-        if (cbAvail > 0)
+        while (PeekNamedPipe(read.Get(), nullptr, 0, nullptr, &cbAvail, nullptr))
         {
             char rgch[4096];
             DWORD cbRead = 0;
-            if (!ReadFile(hRead, rgch, sizeof(rgch), &cbRead, nullptr))
+            if (cbAvail == 0)
+            {
+                return true;
+            }
+            if (!ReadFile(read.Get(), rgch, sizeof(rgch), &cbRead, nullptr))
             {
                 break;
             }
             result.strOutput.append(rgch, cbRead);
-            continue;
         }
-        if (WaitForSingleObject(pi.hProcess, 20) == WAIT_OBJECT_0)
+        return false;
+    };
+    // Until the child has ended and its output is read, or time runs out. The output may
+    // close before the process ends (its exit code is known only then), and a process that
+    // handed the pipe on may end before its output closes.
+    ULONGLONG ullDeadline = GetTickCount64() + dwTimeoutMs;
+    bool fOpen = true;
+    for (;;)
+    {
+        fOpen = fOpen && ReadAvailable();
+        DWORD dwWaitMs = fOpen ? 20 : 200;
+        if (WaitForSingleObject(process.Get(), dwWaitMs) == WAIT_OBJECT_0)
         {
-            // Drain what is left, then stop.
-            while (PeekNamedPipe(hRead, nullptr, 0, nullptr, &cbAvail, nullptr) && cbAvail > 0)
-            {
-                char rgch[4096];
-                DWORD cbRead = 0;
-                if (!ReadFile(hRead, rgch, sizeof(rgch), &cbRead, nullptr))
-                {
-                    break;
-                }
-                result.strOutput.append(rgch, cbRead);
-            }
+            ReadAvailable();
             break;
         }
         if (GetTickCount64() > ullDeadline)
         {
             result.fTimedOut = true;
-            TerminateProcess(pi.hProcess, 1);
-            WaitForSingleObject(pi.hProcess, 5000);
+            TerminateProcess(process.Get(), 1);
+            WaitForSingleObject(process.Get(), 5000);
             break;
         }
     }
-    GetExitCodeProcess(pi.hProcess, &result.dwExitCode);
-    CloseHandle(pi.hProcess);
-    CloseHandle(hRead);
+    GetExitCodeProcess(process.Get(), &result.dwExitCode);
     return result;
 }
 
@@ -332,12 +320,10 @@ void HklmSetBytes(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD dw
                   const void *pv, DWORD cb)
 {
     CRegKeyHandle key;
-    HKEY hKey = nullptr;
     ASSERT_EQ(ERROR_SUCCESS, RegCreateKeyExW(HKEY_LOCAL_MACHINE, wstrKey.c_str(), 0, nullptr, 0,
-                                             KEY_WRITE, nullptr, &hKey, nullptr));
-    key.Reset(hKey);
+                                             KEY_WRITE, nullptr, key.Receive(), nullptr));
     EXPECT_EQ(ERROR_SUCCESS,
-              RegSetValueExW(hKey, wszValue, 0, dwType, static_cast<const BYTE *>(pv), cb));
+              RegSetValueExW(key.Get(), wszValue, 0, dwType, static_cast<const BYTE *>(pv), cb));
 }
 
 void HklmSetDword(const std::wstring &wstrKey, const wchar_t *wszValue, DWORD dwValue)
