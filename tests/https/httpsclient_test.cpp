@@ -370,8 +370,6 @@ TEST_F(HttpsClientTest, EarlyFailuresReturnTheFailingCallsCode)
     const Case rgCases[] = {
         {"UnknownScheme", L"ftp://localhost:47127/v1/api/config/udpecho", false, false,
          HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), 1},
-        {"NotAUrl", L"not a url", false, false,
-         HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), 1},
         // Wine does not implement decompression (option 118, 12009) on the session, where the
         // client sets it; a connection handle refuses it outright (12018).
         {"GzipUnderWine", L"https://localhost:47128/v1/api/config/udpecho", true, false,
