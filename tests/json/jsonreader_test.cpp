@@ -93,11 +93,6 @@ TEST(JsonReader, KeepsScalarsRawAndLeavesCheckingToCallers)
     EXPECT_EQ('\0', *pszEnd);
     EXPECT_EQ(strOpen.size(), static_cast<size_t>(pszEnd - strOpen.c_str()));
 
-    // Duplicates stay; lookups find the first.
-    std::unique_ptr<JsonValue> dup = Read("{\"a\":1,\"a\":2}");
-    EXPECT_EQ(2u, AsObject(dup).Members().size());
-    EXPECT_EQ("1", MemberText(AsObject(dup), "a"));
-
     // No grammar check: a missing comma goes unnoticed, stray text joins the scalar.
     std::unique_ptr<JsonValue> loose = Read("{\"a\":[] \"b\":2, \"c\":tru e ,\"d\":x]}");
     EXPECT_EQ("[]", MemberText(AsObject(loose), "a"));

@@ -225,15 +225,6 @@ TEST(StateNotify, QueryReturnsTheLatestPublicationWithItsStamp)
               NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, vbSmall.data(), &cb));
     EXPECT_EQ(WNF_STATE_MAX_DATA_SIZE, cb);
     EXPECT_EQ(std::vector<BYTE>(16, 0xEE), vbSmall);
-
-    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 0));
-    DWORD dwValue = 0xFFFFFFFF;
-    cb = sizeof(dwValue);
-    ASSERT_EQ(STATUS_SUCCESS,
-              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, &dwValue, &cb));
-    EXPECT_EQ(3u, stamp);
-    EXPECT_EQ(sizeof(dwValue), cb);
-    EXPECT_EQ(0u, dwValue);
 }
 
 TEST(StateNotify, ConcurrentPublishersRaiseTheStampOncePerPublication)
