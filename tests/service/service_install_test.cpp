@@ -41,13 +41,6 @@ BOOL WINAPI RecordConfig2(SC_HANDLE hService, DWORD dwInfoLevel, LPVOID pvInfo)
     return ChangeServiceConfig2W(hService, dwInfoLevel, pvInfo);
 }
 
-std::wstring ExePath()
-{
-    wchar_t wszPath[MAX_PATH];
-    GetModuleFileNameW(nullptr, wszPath, MAX_PATH);
-    return wszPath;
-}
-
 std::vector<std::wstring> GroupList(const std::wstring &wstrGroup)
 {
     return RegHelperGetMultiString(c_wszSvchostGroupKey, wstrGroup.c_str());
@@ -108,7 +101,9 @@ TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
     service.RegisterOneService();
     ASSERT_EQ(0u, failures.Count());
 
-    std::wstring wstrExe = ExePath();
+    wchar_t wszExe[MAX_PATH];
+    GetModuleFileNameW(nullptr, wszExe, MAX_PATH);
+    const std::wstring wstrExe = wszExe;
     testsupport::SERVICE_RECORD record;
     ASSERT_TRUE(testsupport::ServiceReadRecord(service.ServiceName(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
