@@ -26,7 +26,6 @@ struct REPORT
 {
     DWORD dwState;
     DWORD dwCheckPoint;
-    DWORD dwWaitHint;
 };
 
 std::mutex s_reportLock;
@@ -35,7 +34,7 @@ std::vector<REPORT> s_rgReports;
 BOOL WINAPI RecordReport(SERVICE_STATUS_HANDLE hStatus, LPSERVICE_STATUS pStatus)
 {
     std::lock_guard<std::mutex> guard(s_reportLock);
-    s_rgReports.push_back({pStatus->dwCurrentState, pStatus->dwCheckPoint, pStatus->dwWaitHint});
+    s_rgReports.push_back({pStatus->dwCurrentState, pStatus->dwCheckPoint});
     return TRUE;
 }
 
@@ -165,14 +164,13 @@ TEST_F(ServiceShell, SetStatusCheckPointsAndNothingAfterStopped)
     service.SetStatus(SERVICE_RUNNING);
     service.SetStatus(SERVICE_RUNNING);
 
-    std::vector<REPORT> rgReports = Reports();
-    ASSERT_EQ(5u, rgReports.size());
-    DWORD rgExpected[5][2] = {{2, 0}, {2, 1}, {2, 2}, {4, 0}, {1, 0}};
-    for (size_t i = 0; i < 5; i++)
+    std::vector<std::pair<DWORD, DWORD>> rgStateAndCheckPoint;
+    for (const REPORT &report : Reports())
     {
-        EXPECT_EQ(rgExpected[i][0], rgReports[i].dwState) << i;
-        EXPECT_EQ(rgExpected[i][1], rgReports[i].dwCheckPoint) << i;
+        rgStateAndCheckPoint.push_back({report.dwState, report.dwCheckPoint});
     }
+    EXPECT_EQ((std::vector<std::pair<DWORD, DWORD>>{{2, 0}, {2, 1}, {2, 2}, {4, 0}, {1, 0}}),
+              rgStateAndCheckPoint);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
     EXPECT_EQ(1u, service.m_status.dwCheckPoint);
     EXPECT_TRUE(log.Contains(L"CService::SetStatus: Steady is START_PENDING\r\n"));
