@@ -9,23 +9,12 @@
 
 #include "servicelib/service.h"
 
+#include <algorithm>
 #include <string>
 
 const DWORD c_dwChildReleaseTimeoutMs = 60000;
 const DWORD c_dwChildLingerMs = 1000;
 inline volatile LONG g_cChildBreakpoints = 0;
-
-inline bool HasArg(DWORD argc, LPWSTR *argv, const wchar_t *wszArg)
-{
-    for (DWORD i = 1; i < argc; i++)
-    {
-        if (wcscmp(argv[i], wszArg) == 0)
-        {
-            return true;
-        }
-    }
-    return false;
-}
 
 // Runs on the dispatcher's service thread (ServiceMain), a thread-pool thread (OnStart) and
 // the stop thread (OnStop). One static instance per program.
@@ -37,9 +26,13 @@ public:
     {
         m_wstrName = argv[0];
         m_wszServiceName = m_wstrName.c_str();
-        m_fHoldStart = HasArg(argc, argv, L"hold-start");
-        m_fHoldStop = HasArg(argc, argv, L"hold-stop");
-        m_fLinger = HasArg(argc, argv, L"linger");
+        auto fnHas = [&](const wchar_t *wszArg) {
+            return std::any_of(argv + 1, argv + argc,
+                               [&](LPWSTR wsz) { return wcscmp(wsz, wszArg) == 0; });
+        };
+        m_fHoldStart = fnHas(L"hold-start");
+        m_fHoldStop = fnHas(L"hold-stop");
+        m_fLinger = fnHas(L"linger");
     }
     void OnStart() override
     {

@@ -1,6 +1,7 @@
 // The shell's ServiceMain under the prefix's real control manager, in a test service of its
 // own (servicetest_child.exe) or in telvanehost.exe (servicetest.dll, or telvane.dll under a
 // name it does not serve), under test-only names.
+#include "inc/handleholder.h"
 #include "servicelib/reghelper.h"
 #include "servicelib/service.h"
 #include "tests/common/scmtest.h"
@@ -15,34 +16,10 @@ using namespace testsupport;
 
 namespace
 {
-// The release event of a "hold-stop" service (see childservice.h), signalled and closed however
-// the test ends so that the service can stop before the test removes it. Test thread only.
-class CReleaseOnExit
-{
-public:
-    explicit CReleaseOnExit(const wchar_t *wszService)
-        : m_hEvent(CreateEventW(nullptr, TRUE, FALSE,
-                                (std::wstring(L"Global\\") + wszService + L"_release").c_str()))
-    {
-    }
-    ~CReleaseOnExit()
-    {
-        if (m_hEvent != nullptr)
-        {
-            SetEvent(m_hEvent);
-            CloseHandle(m_hEvent);
-        }
-    }
-    CReleaseOnExit(const CReleaseOnExit &) = delete;
-    CReleaseOnExit &operator=(const CReleaseOnExit &) = delete;
-    HANDLE Get() const { return m_hEvent; }
-
-private:
-    HANDLE m_hEvent;
-};
-
 // A test-only service, deleted again at the end: servicetest_child.exe in a process of its own,
-// or the DLL given run by telvanehost.exe alone in a test-only group. Test thread only.
+// or the DLL given run by telvanehost.exe alone in a test-only group. It holds the release event
+// of a "hold-stop" service (see childservice.h) and signals it however the test ends, so that
+// the service can stop before it is removed. Test thread only.
 class CTestServiceHolder
 {
 public:
@@ -50,6 +27,8 @@ public:
         : m_wstrName(UniqueName(wszDll == nullptr ? L"TelvaneTestChild" : L"TelvaneTestHosted"))
         , m_wstrGroup(UniqueName(L"TelvaneTestGroup"))
         , m_cleanup(m_wstrName)
+        , m_release(
+              CreateEventW(nullptr, TRUE, FALSE, (L"Global\\" + m_wstrName + L"_release").c_str()))
     {
         if (wszDll == nullptr)
         {
@@ -68,9 +47,14 @@ public:
             RegHelperSetMultiString(c_wszSvchostGroupKey, m_wstrGroup.c_str(), {m_wstrName});
         }
     }
-    ~CTestServiceHolder() { RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str()); }
+    ~CTestServiceHolder()
+    {
+        Release();
+        RegHelperDeleteValue(c_wszSvchostGroupKey, m_wstrGroup.c_str());
+    }
     const wchar_t *Name() const { return m_wstrName.c_str(); }
-    bool Created() const { return m_fCreated; }
+    bool Created() const { return m_fCreated && m_release.Get() != nullptr; }
+    void Release() { SetEvent(m_release.Get()); }
 
     // Starts with the parameters and waits for RUNNING; the service's process id, or 0.
     DWORD StartRunning(const std::vector<std::wstring> &rgArgs)
@@ -86,6 +70,7 @@ private:
     std::wstring m_wstrName;
     std::wstring m_wstrGroup;
     CServiceCleanup m_cleanup;
+    CKernelHandle m_release;
     bool m_fCreated = false;
 };
 } // namespace
@@ -124,64 +109,20 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
     }
 }
 
-// Any client with user-control access (on Windows, interactive users by default) can send
-// a control of 128 to 255 to any service, whether it asked for them or not. One it never
-// asked for must leave it running: here the default OnControl would end the process.
-TEST(ServiceMainUnderScm, UserControlNobodyAskedForLeavesTheServiceRunning)
-{
-    CTestServiceHolder child;
-    ASSERT_TRUE(child.Created());
-    CServiceProcess process(child.StartRunning({}));
-    ASSERT_TRUE(process.Opened());
-
-    SERVICE_STATUS statusControl = {};
-    EXPECT_EQ(0u, ServiceControl(child.Name(), 200, &statusControl));
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
-
-    // Still alive: it stops as usual, with no breakpoint seen, and its process leaves cleanly.
-    SERVICE_STATUS_PROCESS status = {};
-    EXPECT_EQ(0u, ServiceStop(child.Name()));
-    EXPECT_TRUE(ServiceWaitForState(child.Name(), SERVICE_STOPPED, c_dwWaitMs, &status));
-    EXPECT_EQ(0u, status.dwServiceSpecificExitCode);
-    DWORD dwExitCode = process.WaitForExitCode(c_dwWaitMs);
-    EXPECT_EQ(0u, dwExitCode) << std::hex << dwExitCode;
-}
-
 // Under telvanehost a STOP reaches OnStop through the host's stop callback: the control
-// returns at once with RUNNING while OnStop still works, and the host leaves after STOPPED.
-TEST(TelvaneHost, StopGoesThroughTheHostStopCallback)
-{
-    CTestServiceHolder hosted(L"servicetest.dll");
-    ASSERT_TRUE(hosted.Created());
-    CReleaseOnExit release(hosted.Name());
-    ASSERT_NE(nullptr, release.Get());
-    CServiceProcess host(hosted.StartRunning({L"hold-stop"}));
-    ASSERT_TRUE(host.Opened());
-
-    SERVICE_STATUS statusControl = {};
-    EXPECT_EQ(0u, ServiceControl(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
-    SERVICE_STATUS_PROCESS status = {};
-    ASSERT_TRUE(ServiceQueryStatus(hosted.Name(), &status));
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), status.dwCurrentState);
-
-    SetEvent(release.Get());
-    EXPECT_TRUE(ServiceWaitForState(hosted.Name(), SERVICE_STOPPED, c_dwWaitMs));
-    EXPECT_EQ(0u, host.WaitForExitCode(c_dwWaitMs));
-}
-
-// Someone deleted the service while it was stopping (sc stop, sc delete): the record stays,
-// marked for deletion, until the service is down. Unregistering it then is no error: the
-// stopping service cannot take another STOP (1061) and is already marked (1072).
-TEST(TelvaneHost, UnregisterOfAStoppingServiceMarkedForDeletion)
+// returns at once with RUNNING while OnStop still works. Someone then deleted the service while
+// it was stopping (sc stop, sc delete): the record stays, marked for deletion, until the service
+// is down. Unregistering it then is no error: the stopping service cannot take another STOP
+// (1061) and is already marked (1072).
+TEST(TelvaneHost, StopThroughTheHostThenUnregisterOfAServiceMarkedForDeletion)
 {
     FailureCapture failures;
     CTestServiceHolder hosted(L"servicetest.dll");
     ASSERT_TRUE(hosted.Created());
-    CReleaseOnExit release(hosted.Name());
-    ASSERT_NE(nullptr, release.Get());
     ASSERT_NE(0u, hosted.StartRunning({L"hold-stop"}));
-    ASSERT_EQ(0u, ServiceStop(hosted.Name()));
+    SERVICE_STATUS statusControl = {};
+    ASSERT_EQ(0u, ServiceControl(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
     ASSERT_TRUE(ServiceDelete(hosted.Name()));
 
     CTestService service(hosted.Name());
@@ -194,7 +135,7 @@ TEST(TelvaneHost, UnregisterOfAStoppingServiceMarkedForDeletion)
     // Where the record lasts until the service is down (Windows), unregistering waits for
     // it: let the service go after a while. Wine drops the record at once.
     WaitUntil([&] { return fDone.load(); }, 1000);
-    SetEvent(release.Get());
+    hosted.Release();
     unregister.join();
     EXPECT_EQ(0u, failures.Count());
     EXPECT_FALSE(ServiceExists(hosted.Name()));

@@ -13,8 +13,7 @@ public:
     enum class StartMode
     {
         ReportRunning,
-        StopItself,
-        Nothing
+        StopItself
     };
 
     explicit CTestService(const wchar_t *wszName, StartMode mode = StartMode::ReportRunning)
@@ -27,13 +26,9 @@ public:
     void OnStart() override
     {
         InterlockedIncrement(&m_cStarts);
-        if (m_mode == StartMode::ReportRunning)
+        SetStatus(SERVICE_RUNNING);
+        if (m_mode == StartMode::StopItself)
         {
-            SetStatus(SERVICE_RUNNING);
-        }
-        else if (m_mode == StartMode::StopItself)
-        {
-            SetStatus(SERVICE_RUNNING);
             SetStatus(SERVICE_STOPPED);
         }
         // A start on the thread pool must be over before the test's service goes away.
@@ -82,7 +77,6 @@ public:
     using CService::m_idsLocalizedName;
     using CService::m_pNextService;
     using CService::m_status;
-    using CService::m_ulFailureAction;
     using CService::m_ulServiceBit;
     using CService::m_ulStartType;
 
