@@ -14,9 +14,7 @@ namespace
 // what arrives, not how fast.
 const DWORD c_dwLoadStepMs = 240000;
 
-class CoreLoad : public CCoreTest
-{
-};
+using CoreLoad = CCoreTest;
 } // namespace
 
 TEST_F(CoreLoad, TwoHundredActivitiesAndFiftyCollectors)
@@ -25,19 +23,13 @@ TEST_F(CoreLoad, TwoHundredActivitiesAndFiftyCollectors)
     const size_t cActivities = 200;
     const size_t cEvents = 50;
 
-    std::vector<GUID> rgCollectorIds;
+    std::vector<GUID> rgCollectorIds(cCollectors);
     std::vector<std::unique_ptr<CCollectorThread>> rgCollectors;
     for (size_t i = 0; i < cCollectors; i++)
     {
-        rgCollectorIds.push_back(NewGuid());
-        rgCollectors.emplace_back(new CCollectorThread(CollectorPipe(), rgCollectorIds.back(),
-                                                       "\"r" + std::to_string(i) + "\""));
+        rgCollectorIds[i] = NewGuid();
+        rgCollectors.push_back(StartCollector(rgCollectorIds[i], "\"r" + std::to_string(i) + "\""));
     }
-    for (auto &collector : rgCollectors)
-    {
-        ASSERT_TRUE(collector->WaitRegistered());
-    }
-    ASSERT_TRUE(m_trace.WaitFor("TelvaneService::ReportConnectedCollector()", cCollectors));
     // From here on the service traces into nothing, as it does on a phone without a session.
     m_trace.Enable(false);
 
@@ -95,12 +87,13 @@ TEST_F(CoreLoad, TwoHundredActivitiesAndFiftyCollectors)
         rgExpectedEvents.push_back(std::to_string(e));
     }
     std::set<std::wstring> files;
+    std::map<std::string, std::vector<DeliveredLog>> mapLogs = LogsByRun();
     for (size_t i = 0; i < cActivities; i++)
     {
-        std::vector<DeliveredLog> rgLogs = LogsOf(rgLogIds[i]);
+        std::vector<DeliveredLog> &rgLogs = mapLogs[GuidText(rgLogIds[i])];
         ASSERT_EQ(1u, rgLogs.size()) << i;
         const rapidjson::Value &log = *rgLogs[0].doc;
-        EXPECT_TRUE(log["LogEnd"].GetBool());
+        EXPECT_TRUE(EndsRun(log));
         EXPECT_EQ(rgExpectedEvents, GroupValues(log, eventId)) << i;
         for (size_t c = 0; c < cCollectors; c++)
         {

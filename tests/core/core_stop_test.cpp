@@ -10,12 +10,7 @@
 
 using namespace coretest;
 
-namespace
-{
-class CoreStop : public CCoreTest
-{
-};
-} // namespace
+using CoreStop = CCoreTest;
 
 TEST_F(CoreStop, WithNoClients)
 {
@@ -97,9 +92,10 @@ TEST_F(CoreStop, WithAHundredClientsConnected)
     }
     ASSERT_TRUE(m_trace.WaitFor(c_szActivityEvent, rgLogIds.size()));
     Stop();
+    std::map<std::string, std::vector<DeliveredLog>> mapLogs = LogsByRun();
     for (const GUID &logId : rgLogIds)
     {
-        EXPECT_EQ(1u, LogsOf(logId).size());
+        EXPECT_EQ(1u, mapLogs[GuidText(logId)].size());
     }
 }
 
@@ -108,15 +104,21 @@ TEST_F(CoreStop, WithAHundredClientsConnected)
 TEST_F(CoreStop, WhileClientsKeepArriving)
 {
     std::atomic<bool> fStop(false);
+    std::mutex lockLogIds;
     std::vector<std::thread> rgThreads;
     for (int i = 0; i < 6; i++)
     {
         rgThreads.emplace_back([&] {
             while (!fStop)
             {
+                GUID logId = NewGuid();
+                {
+                    std::lock_guard<std::mutex> guard(lockLogIds);
+                    m_rgLogIds.push_back(logId);
+                }
                 CActivityClient client(2000);
                 if (SUCCEEDED(client.Connect(ActivityPipe().c_str())) &&
-                    SUCCEEDED(client.Start(NewGuid(), NewGuid())))
+                    SUCCEEDED(client.Start(NewGuid(), logId)))
                 {
                     client.SendEvent(NewGuid(), "1", 1);
                 }
