@@ -67,7 +67,7 @@ protected:
         // A clean exit: the unload check found nothing left (a failed check ends the host with
         // a fail-fast code).
         EXPECT_EQ(0u, host.WaitForExitCode(2 * c_dwWaitMs));
-        std::map<std::string, std::vector<DeliveredLog>> mapLogs = LogsByRun();
+        RunLogs mapLogs = LogsByRun();
         for (const GUID &logId : m_rgLogIds)
         {
             std::vector<DeliveredLog> &rgLogs = mapLogs[GuidText(logId)];

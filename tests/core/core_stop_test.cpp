@@ -92,7 +92,7 @@ TEST_F(CoreStop, WithAHundredClientsConnected)
     }
     ASSERT_TRUE(m_trace.WaitFor(c_szActivityEvent, rgLogIds.size()));
     Stop();
-    std::map<std::string, std::vector<DeliveredLog>> mapLogs = LogsByRun();
+    RunLogs mapLogs = LogsByRun();
     for (const GUID &logId : rgLogIds)
     {
         EXPECT_EQ(1u, mapLogs[GuidText(logId)].size());

@@ -44,9 +44,10 @@ inline std::vector<std::string> OnlyLogValues(const GUID &logId, const GUID &id)
 }
 
 // Every delivered log, by its run's LogID, read in one pass over the trace folder.
-inline std::map<std::string, std::vector<DeliveredLog>> LogsByRun()
+typedef std::map<std::string, std::vector<DeliveredLog>> RunLogs;
+inline RunLogs LogsByRun()
 {
-    std::map<std::string, std::vector<DeliveredLog>> mapLogs;
+    RunLogs mapLogs;
     for (DeliveredLog &log : DeliveredLogs())
     {
         auto it = log.doc->FindMember("LogID");
@@ -60,7 +61,7 @@ inline std::map<std::string, std::vector<DeliveredLog>> LogsByRun()
 
 inline void DeleteLogsOfRuns(const std::vector<GUID> &rgLogIds)
 {
-    std::map<std::string, std::vector<DeliveredLog>> mapLogs = LogsByRun();
+    RunLogs mapLogs = LogsByRun();
     for (const GUID &logId : rgLogIds)
     {
         for (const DeliveredLog &log : mapLogs[GuidText(logId)])

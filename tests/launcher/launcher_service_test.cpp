@@ -10,7 +10,9 @@
 #include "tests/common/policyserver.h"
 #include "tests/common/udpsupport.h"
 
+#include <algorithm>
 #include <functional>
+#include <iterator>
 #include <memory>
 
 using namespace launchertest;
@@ -336,14 +338,10 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
 
         ToggleBacklight({0, 0, 0, 0});
         StopService(); // every handler has run when the launcher is destroyed
-        std::vector<std::string> rgFailures;
-        for (const std::string &strLine : m_trace.Lines())
-        {
-            if (strLine.compare(0, 5, "2001|") == 0)
-            {
-                rgFailures.push_back(strLine);
-            }
-        }
+        std::vector<std::string> rgLines = m_trace.Lines(), rgFailures;
+        std::copy_if(
+            rgLines.begin(), rgLines.end(), std::back_inserter(rgFailures),
+            [](const std::string &strLine) { return strLine.compare(0, 5, "2001|") == 0; });
         EXPECT_EQ(c.rgExpected, rgFailures);
         EXPECT_FALSE(m_trace.Contains(c_szLaunched));
         EXPECT_EQ(cLaunches, ChamberLaunchCount());
