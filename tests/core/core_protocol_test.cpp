@@ -278,5 +278,7 @@ TEST_F(CoreProtocol, AllZeroIdentifiersAreOrdinary)
     RunActivity(zero, zero, {{eventId, "\"zero run\""}});
     EXPECT_EQ((std::vector<std::string>{"\"zero run\""}), OnlyLogValues(zero, eventId));
     EXPECT_EQ((std::vector<std::string>{"\"zero collector\""}), OnlyLogValues(zero, zero));
-    EXPECT_EQ(GuidText(zero), (*WaitForLogs(zero, 1)[0].doc)["ActivityID"].GetString());
+    std::vector<DeliveredLog> rgLogs = WaitForLogs(zero, 1);
+    ASSERT_EQ(1u, rgLogs.size());
+    EXPECT_EQ(GuidText(zero), (*rgLogs[0].doc)["ActivityID"].GetString());
 }
