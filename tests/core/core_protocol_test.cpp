@@ -232,19 +232,17 @@ TEST_F(CoreProtocol, EventPastTheItemCapClosesThePipe)
     ExpectServing();
 }
 
-struct SilentClientCase
-{
-    const char *szName;
-    bool fCollector;
-    bool fNegotiate;
-    bool fLeave;
-};
-
 // One client that connects and then says nothing (or leaves before it identifies itself) must
 // not keep the next clients out.
 TEST_F(CoreProtocol, UnidentifiedClientsKeepNobodyOut)
 {
-    const SilentClientCase rgCases[] = {
+    const struct
+    {
+        const char *szName;
+        bool fCollector;
+        bool fNegotiate;
+        bool fLeave;
+    } rgCases[] = {
         {"activity client that sends nothing", false, false, false},
         {"activity client that leaves after the version", false, true, true},
         {"activity client that leaves at once", false, false, true},
@@ -252,7 +250,7 @@ TEST_F(CoreProtocol, UnidentifiedClientsKeepNobodyOut)
         {"collector client that leaves after the version", true, true, true},
     };
     std::vector<std::unique_ptr<CPipeClient>> rgHeld;
-    for (const SilentClientCase &c : rgCases)
+    for (const auto &c : rgCases)
     {
         SCOPED_TRACE(c.szName);
         std::unique_ptr<CPipeClient> pipe(new CPipeClient());
@@ -280,6 +278,7 @@ TEST_F(CoreProtocol, AllZeroIdentifiersAreOrdinary)
     RunActivity(zero, zero, {{eventId, "\"zero run\""}});
     EXPECT_EQ((std::vector<std::string>{"\"zero run\""}), OnlyLogValues(zero, eventId));
     EXPECT_EQ((std::vector<std::string>{"\"zero collector\""}), OnlyLogValues(zero, zero));
-    EXPECT_EQ(GuidText(zero), (*WaitForLogs(zero, 1)[0].doc)["ActivityID"].GetString());
-    ExpectServing();
+    std::vector<DeliveredLog> rgLogs = WaitForLogs(zero, 1);
+    ASSERT_EQ(1u, rgLogs.size());
+    EXPECT_EQ(GuidText(zero), (*rgLogs[0].doc)["ActivityID"].GetString());
 }

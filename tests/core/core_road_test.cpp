@@ -6,30 +6,19 @@
 
 using namespace coretest;
 
-namespace
-{
-class CoreRoad : public CCoreTest
-{
-};
-
-// JSON text of about cb bytes, so that it travels in several parts.
-std::string LongJson(size_t cb, char ch)
-{
-    return "\"" + std::string(cb, ch) + "\"";
-}
-} // namespace
+using CoreRoad = CCoreTest;
 
 TEST_F(CoreRoad, OneActivityWithOneCollectorIsDeliveredWhole)
 {
     GUID collectorId = NewGuid();
-    std::string strResult = "{\"collected\":" + LongJson(3000, 'c') + "}";
+    std::string strResult = "{\"collected\":\"" + std::string(3000, 'c') + "\"}";
     std::unique_ptr<CCollectorThread> collector = StartCollector(collectorId, strResult);
 
     GUID activityId = NewGuid();
     GUID logId = NewGuid();
     GUID eventA = NewGuid();
     GUID eventB = NewGuid();
-    std::string strLong = LongJson(2500, 'e'); // three parts
+    std::string strLong = "\"" + std::string(2500, 'e') + "\""; // three parts
     RunActivity(activityId, logId,
                 {{eventA, "{\"n\":1}"}, {eventB, strLong}, {eventA, "[2,3]"}, {eventA, "4"}});
 

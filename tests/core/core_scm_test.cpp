@@ -18,10 +18,7 @@ protected:
     void TearDown() override
     {
         TelvaneUninstall();
-        for (const GUID &logId : m_rgLogIds)
-        {
-            DeleteLogsOf(logId);
-        }
+        DeleteLogsOfRuns(m_rgLogIds);
     }
 
     // A client on the product's activity pipe, started; its run's files go at the end.
@@ -70,9 +67,10 @@ protected:
         // A clean exit: the unload check found nothing left (a failed check ends the host with
         // a fail-fast code).
         EXPECT_EQ(0u, host.WaitForExitCode(2 * c_dwWaitMs));
+        RunLogs mapLogs = LogsByRun();
         for (const GUID &logId : m_rgLogIds)
         {
-            std::vector<DeliveredLog> rgLogs = LogsOf(logId);
+            std::vector<DeliveredLog> &rgLogs = mapLogs[GuidText(logId)];
             ASSERT_EQ(1u, rgLogs.size());
             EXPECT_TRUE(EndsRun(*rgLogs[0].doc));
         }

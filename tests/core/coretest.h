@@ -10,6 +10,7 @@
 #include "tests/common/tracesession.h"
 
 #include <gtest/gtest.h>
+#include <map>
 #include <memory>
 #include <string>
 #include <utility>
@@ -42,6 +43,34 @@ inline std::vector<std::string> OnlyLogValues(const GUID &logId, const GUID &id)
     return GroupValues(*rgLogs[0].doc, id);
 }
 
+// Every delivered log, by its run's LogID, read in one pass over the trace folder.
+typedef std::map<std::string, std::vector<DeliveredLog>> RunLogs;
+inline RunLogs LogsByRun()
+{
+    RunLogs mapLogs;
+    for (DeliveredLog &log : DeliveredLogs())
+    {
+        auto it = log.doc->FindMember("LogID");
+        if (it != log.doc->MemberEnd() && it->value.IsString())
+        {
+            mapLogs[it->value.GetString()].push_back(std::move(log));
+        }
+    }
+    return mapLogs;
+}
+
+inline void DeleteLogsOfRuns(const std::vector<GUID> &rgLogIds)
+{
+    RunLogs mapLogs = LogsByRun();
+    for (const GUID &logId : rgLogIds)
+    {
+        for (const DeliveredLog &log : mapLogs[GuidText(logId)])
+        {
+            DeleteFileW(log.wstrPath.c_str());
+        }
+    }
+}
+
 // The service ended the connection: reads find the pipe broken (skipping what it sent first).
 inline bool ClosedByService(CPipeClient &pipe)
 {
@@ -70,10 +99,7 @@ protected:
     {
         Stop();
         m_pService.reset();
-        for (const GUID &logId : m_rgLogIds)
-        {
-            DeleteLogsOf(logId);
-        }
+        DeleteLogsOfRuns(m_rgLogIds);
         m_failures.ExpectNone();
     }
 

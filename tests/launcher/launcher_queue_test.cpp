@@ -85,7 +85,9 @@ TEST_F(LauncherQueueTest, BacklightQueuedBehindDestroyStartsNothing)
 // thread and ends that very subscription from inside its callback.
 TEST_F(LauncherQueueTest, DestroyEndsSubscriptionFromInsideItsCallback)
 {
-    CHeldLauncher launcher;
+    // Never freed, as the coordinator's launcher lives as long as its DLL: the callback thread
+    // still returns through it (its Release) after the destroy has completed.
+    CHeldLauncher &launcher = *new CHeldLauncher();
     launcher.HoldNext();
     // The prefix's backlight (1) is delivered to the new subscription at once.
     ASSERT_EQ(0, StateSubscriptionBegin(launcher.SubscriptionSlot(), c_ullBacklightStateName,

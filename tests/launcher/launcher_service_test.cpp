@@ -10,7 +10,9 @@
 #include "tests/common/policyserver.h"
 #include "tests/common/udpsupport.h"
 
+#include <algorithm>
 #include <functional>
+#include <iterator>
 #include <memory>
 
 using namespace launchertest;
@@ -57,10 +59,6 @@ protected:
         Publish(c_ullBacklightStateName, vbData);
         ASSERT_TRUE(m_trace.WaitForLine(c_szHandlerToggled, cToggled + 1));
     }
-    void ToggleBacklight(DWORD dwValue)
-    {
-        ToggleBacklight(std::vector<BYTE>{static_cast<BYTE>(dwValue), 0, 0, 0});
-    }
 
     // An open policy for a loopback relay on usPort that echoes cPackets, the service started
     // and the backlight changed: returns once the test application was launched.
@@ -71,7 +69,7 @@ protected:
         m_pRelay.reset(new CRelayProcess(usPort, L"-packets " + std::to_wstring(cPackets)));
         ASSERT_TRUE(m_pRelay->Listening());
         StartService();
-        ToggleBacklight(0);
+        ToggleBacklight({0, 0, 0, 0});
         ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
     }
 
@@ -182,8 +180,8 @@ TEST_F(LauncherServiceTest, RunningTestIgnoresChangesAndHoldsTheStop)
         EXPECT_EQ(c.fSaveFails, m_trace.Contains("2001|CreateFile (write)|80070005"))
             << "the failed save is traced";
         ASSERT_TRUE(ResultFiles().empty()) << "the test ended before the next change";
-        ToggleBacklight(0);
-        ToggleBacklight(2);
+        ToggleBacklight({0, 0, 0, 0});
+        ToggleBacklight({2, 0, 0, 0});
         EXPECT_EQ(2u, m_trace.CountLines(c_szStillRunning));
 
         StopService();
@@ -220,7 +218,7 @@ TEST_F(LauncherServiceTest, ExpiredPolicyIsRefreshedFromWebService)
     StartService();
 
     ULONGLONG ullBefore = UdpConfigNow();
-    ToggleBacklight(0);
+    ToggleBacklight({0, 0, 0, 0});
     ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
     ULONGLONG ullAfter = UdpConfigNow();
     EXPECT_EQ(Echoed(10), relay.WaitForReport());
@@ -338,16 +336,12 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         m_trace.Clear();
         StartService();
 
-        ToggleBacklight(0);
+        ToggleBacklight({0, 0, 0, 0});
         StopService(); // every handler has run when the launcher is destroyed
-        std::vector<std::string> rgFailures;
-        for (const std::string &strLine : m_trace.Lines())
-        {
-            if (strLine.compare(0, 5, "2001|") == 0)
-            {
-                rgFailures.push_back(strLine);
-            }
-        }
+        std::vector<std::string> rgLines = m_trace.Lines(), rgFailures;
+        std::copy_if(
+            rgLines.begin(), rgLines.end(), std::back_inserter(rgFailures),
+            [](const std::string &strLine) { return strLine.compare(0, 5, "2001|") == 0; });
         EXPECT_EQ(c.rgExpected, rgFailures);
         EXPECT_FALSE(m_trace.Contains(c_szLaunched));
         EXPECT_EQ(cLaunches, ChamberLaunchCount());

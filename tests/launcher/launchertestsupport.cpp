@@ -11,12 +11,6 @@ namespace launchertest
 {
 namespace
 {
-std::wstring ComponentCommand(const wchar_t *wszSwitches)
-{
-    return std::wstring(L"regsvr32.exe ") + wszSwitches + L" " +
-           BinCommand(L"platformcomponent.dll");
-}
-
 // What the prefix keeps between tests and the phone would not have set.
 void ResetPrefix()
 {
@@ -78,7 +72,7 @@ std::wstring ChamberLastCommandLine()
 
 void CLauncherTest::PreparePrefix()
 {
-    ChildResult result = RunChild(ComponentCommand(L"/s"));
+    ChildResult result = RunChild(L"regsvr32.exe /s " + BinCommand(L"platformcomponent.dll"));
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
     InstallTestApplication();
     // No web service: a refresh fails at once at the endpoint directory.
@@ -89,7 +83,7 @@ void CLauncherTest::PreparePrefix()
 
 void CLauncherTest::TearDown()
 {
-    RunChild(ComponentCommand(L"/s /u"));
+    RunChild(L"regsvr32.exe /s /u " + BinCommand(L"platformcomponent.dll"));
     WiFiStandInSetDisconnected();
     // Whatever subscribes next (a service the prefix starts) finds nothing to do.
     ResetPrefix();
