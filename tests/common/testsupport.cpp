@@ -125,6 +125,29 @@ bool LogCapture::Contains(const std::wstring &text) const
     return AnyContains(s_rgLog, text);
 }
 
+BOOL CreateTestProcess(std::wstring wstrCommandLine, BOOL fInheritHandles, DWORD dwFlags,
+                       void *pvEnvironment, STARTUPINFOW *pStartup, PROCESS_INFORMATION *pInfo)
+{
+    const int c_cTries = 3;
+    for (int iTry = 1;; iTry++)
+    {
+        // CreateProcessW may write into the command line.
+        std::wstring wstrCommand = wstrCommandLine;
+        if (CreateProcessW(nullptr, &wstrCommand[0], nullptr, nullptr, fInheritHandles, dwFlags,
+                           pvEnvironment, nullptr, pStartup, pInfo))
+        {
+            return TRUE;
+        }
+        DWORD dwError = GetLastError();
+        if (dwError != ERROR_INTERNAL_ERROR || iTry == c_cTries)
+        {
+            SetLastError(dwError);
+            return FALSE;
+        }
+        Sleep(100);
+    }
+}
+
 ChildResult RunChild(const std::wstring &wstrCommandLine,
                      const std::vector<std::wstring> &rgEnvironment, DWORD dwTimeoutMs)
 {
@@ -168,9 +191,8 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
     si.hStdOutput = write.Get();
     si.hStdError = write.Get();
     PROCESS_INFORMATION pi = {};
-    std::wstring cmd = wstrCommandLine;
-    BOOL fCreated = CreateProcessW(nullptr, &cmd[0], nullptr, nullptr, TRUE,
-                                   CREATE_UNICODE_ENVIRONMENT, &block[0], nullptr, &si, &pi);
+    BOOL fCreated =
+        CreateTestProcess(wstrCommandLine, TRUE, CREATE_UNICODE_ENVIRONMENT, &block[0], &si, &pi);
     write.Close();
     if (!fCreated)
     {

@@ -64,6 +64,12 @@ ChildResult RunChild(const std::wstring &wstrCommandLine,
                      const std::vector<std::wstring> &rgEnvironment = {},
                      DWORD dwTimeoutMs = 60000);
 
+// CreateProcessW for the harness's own children. Wine now and then reports
+// ERROR_INTERNAL_ERROR when a new process ends during its start-up, before it ran any of its
+// own code; such a start is tried again (a few times), any other failure is returned at once.
+BOOL CreateTestProcess(std::wstring wstrCommandLine, BOOL fInheritHandles, DWORD dwFlags,
+                       void *pvEnvironment, STARTUPINFOW *pStartup, PROCESS_INFORMATION *pInfo);
+
 // Directory of the running test executable, with a trailing backslash (build\bin\).
 std::wstring BinDir();
 // A program or DLL of the build, quoted for a command line.

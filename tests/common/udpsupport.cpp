@@ -74,8 +74,7 @@ CRelayProcess::CRelayProcess(unsigned short usPort, const std::wstring &wstrExtr
                                wstrExtraArguments;
     STARTUPINFOW si = {sizeof(si)};
     PROCESS_INFORMATION pi = {};
-    if (!CreateProcessW(nullptr, &wstrCommand[0], nullptr, nullptr, FALSE, CREATE_NO_WINDOW,
-                        nullptr, nullptr, &si, &pi))
+    if (!CreateTestProcess(wstrCommand, FALSE, CREATE_NO_WINDOW, nullptr, &si, &pi))
     {
         ADD_FAILURE() << "CreateProcess " << GetLastError();
         CloseHandle(hReady);
