@@ -8,6 +8,7 @@
 //  - the time from STOP to STOPPED with 200 clients connected.
 // Logs go to files in C:\Data\Test\WiFiLog while it runs; the delivery values and the files
 // are put back as they were.
+#include "bench/benchsupport.h"
 #include "service/cserviceoperation.h"
 #include "service/telvaneservice.h"
 #include "servicelib/asyncpipe.h"
@@ -167,46 +168,6 @@ double BenchService(int cClients, int cEventsPerClient, std::vector<GUID> *prgLo
 
 // The transport alone: AsyncPipe instances whose sink only counts, fed the same event
 // messages by the same kind of clients.
-class CCountingSink : public IPipeDataSink, public IPipeConnectSink
-{
-public:
-    explicit CCountingSink(std::atomic<LONGLONG> *pcMessages)
-        : m_pcMessages(pcMessages)
-    {
-    }
-    virtual ~CCountingSink() = default;
-    HRESULT STDMETHODCALLTYPE QueryInterface(REFIID, void **ppv) override
-    {
-        *ppv = nullptr;
-        return E_NOINTERFACE;
-    }
-    ULONG STDMETHODCALLTYPE AddRef() override { return InterlockedIncrement(&m_cRef); }
-    ULONG STDMETHODCALLTYPE Release() override
-    {
-        ULONG cRef = InterlockedDecrement(&m_cRef);
-        if (cRef == 0)
-        {
-            delete this;
-        }
-        return cRef;
-    }
-    HRESULT STDMETHODCALLTYPE IncomingMessage(const BYTE *, ULONG) override
-    {
-        ++*m_pcMessages;
-        return S_OK;
-    }
-    HRESULT STDMETHODCALLTYPE PipeBroken() override { return S_OK; }
-    HRESULT STDMETHODCALLTYPE Connected() override
-    {
-        // The service speaks first; so does this stand-in, so the clients' negotiation works.
-        return S_OK;
-    }
-
-private:
-    volatile LONG m_cRef = 1;
-    std::atomic<LONGLONG> *m_pcMessages;
-};
-
 double BenchTransport(int cClients, int cEventsPerClient)
 {
     std::wstring name = BenchName(L"transport");
@@ -214,7 +175,7 @@ double BenchTransport(int cClients, int cEventsPerClient)
     std::vector<AsyncPipe *> pipes;
     for (int c = 0; c < cClients; c++)
     {
-        CCountingSink *pSink = new CCountingSink(&cMessages);
+        CBenchCountingSink *pSink = new CBenchCountingSink(&cMessages);
         AsyncPipe *pPipe = new AsyncPipe();
         pPipe->Listen(name.c_str(), pSink, pSink);
         pSink->Release();

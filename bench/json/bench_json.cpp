@@ -2,6 +2,7 @@
 // same run: building and writing a trace-shaped document (a header, 100 groups of 100
 // records with 200-byte raw values), and reading a 1 MiB document. Prints MB/s (10^6 bytes
 // of JSON text per second, best of five rounds) and the ratios; never run as a test.
+#include "bench/benchsupport.h"
 #include "lib/cjsonobject.h"
 #include "lib/jsonreader.h"
 
@@ -21,13 +22,6 @@ const ULONG c_cGroups = 100;
 const ULONG c_cRecords = 100;
 const size_t c_cbReadDocument = 1024 * 1024;
 
-const GUID c_guidActivity = {
-    0x6f1d2a40, 0x3c1e, 0x4b7a, {0x9d, 0x55, 0x1a, 0x2b, 0x3c, 0x4d, 0x5e, 0x6f}};
-const GUID c_guidSession = {
-    0x0a1b2c3d, 0x4e5f, 0x6071, {0x82, 0x93, 0xa4, 0xb5, 0xc6, 0xd7, 0xe8, 0xf9}};
-const GUID c_guidLog = {
-    0x12345678, 0x9abc, 0xdef0, {0x12, 0x34, 0x56, 0x78, 0x9a, 0xbc, 0xde, 0xf0}};
-
 struct PhoneItem
 {
     const char *szKey;
@@ -45,33 +39,18 @@ struct Workload
     std::vector<std::string> rgstrValues;    // one 200-byte JSON object per record
 };
 
-// An activity event as a client sends it: a JSON object of exactly 200 bytes.
-std::string RecordValue(ULONG i)
-{
-    char szValue[256];
-    int cch = snprintf(szValue, sizeof(szValue),
-                       "{\"Event\":\"Connect\",\"Bssid\":\"00:11:22:33:%02x:%02x\",\"Rssi\":-%lu,"
-                       "\"Channel\":%lu,\"Band\":\"5GHz\",\"Reason\":0,\"Detail\":\"",
-                       static_cast<unsigned>(i & 0xFF), static_cast<unsigned>((i >> 8) & 0xFF),
-                       40 + i % 50, 1 + i % 13);
-    std::string str(szValue, static_cast<size_t>(cch));
-    str.append(200 - str.size() - 2, 'x');
-    str += "\"}";
-    return str;
-}
-
 Workload MakeWorkload()
 {
     Workload work;
     for (ULONG g = 0; g < c_cGroups; g++)
     {
-        GUID guid = c_guidLog;
+        GUID guid = c_guidBenchLog;
         guid.Data1 = g;
         work.rgstrGroupKeys.push_back("ID" + GuidToString(guid));
     }
     for (ULONG r = 0; r < c_cRecords; r++)
     {
-        work.rgstrValues.push_back(RecordValue(r));
+        work.rgstrValues.push_back(BenchRecordValue(r));
     }
     return work;
 }
@@ -81,10 +60,10 @@ Workload MakeWorkload()
 CJsonObject *BuildTrace(const Workload &work, ULONG cGroups)
 {
     CJsonObject *pTrace = new CJsonObject();
-    pTrace->AddGuid("ActivityID", c_guidActivity);
-    pTrace->AddGuid("SessionID", c_guidSession);
+    pTrace->AddGuid("ActivityID", c_guidBenchActivity);
+    pTrace->AddGuid("SessionID", c_guidBenchSession);
     pTrace->AddDword("JsonVersion", 24);
-    pTrace->AddGuid("LogID", c_guidLog);
+    pTrace->AddGuid("LogID", c_guidBenchLog);
     pTrace->AddString("WiFiConnID", L"00000000-0000-0000-0000-000000000000");
     pTrace->AddDword("LogCount", 1);
     pTrace->AddUlonglong("TimeStamp", 133000000000000000ull);
@@ -128,13 +107,13 @@ std::string WriteTraceRapid(const Workload &work)
     rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
     writer.StartObject();
     writer.Key("ActivityID");
-    writer.String(GuidToString(c_guidActivity).c_str());
+    writer.String(GuidToString(c_guidBenchActivity).c_str());
     writer.Key("SessionID");
-    writer.String(GuidToString(c_guidSession).c_str());
+    writer.String(GuidToString(c_guidBenchSession).c_str());
     writer.Key("JsonVersion");
     writer.Uint(24);
     writer.Key("LogID");
-    writer.String(GuidToString(c_guidLog).c_str());
+    writer.String(GuidToString(c_guidBenchLog).c_str());
     writer.Key("WiFiConnID");
     writer.String(WideToNarrow(L"00000000-0000-0000-0000-000000000000").c_str());
     writer.Key("LogCount");

@@ -2,6 +2,7 @@
 // beside a plain blocking server loop (one thread per instance, ReadFile in a loop) measured
 // in the same run on the same machine: the platform's own limit. 1 and 8 concurrent clients,
 // small and full-size messages; the clients are the same plain blocking writers in both.
+#include "bench/benchsupport.h"
 #include "servicelib/asyncpipe.h"
 #include "client/cpipeclient.h"
 
@@ -30,54 +31,6 @@ std::wstring BenchPipeName(const wchar_t *wszTag, int iRun)
              iRun);
     return wsz;
 }
-
-// Counts what arrives; signals when the expected number of messages is in.
-class CCountingSink : public IPipeDataSink, public IPipeConnectSink
-{
-public:
-    CCountingSink(std::atomic<LONGLONG> *pcMessages, std::atomic<LONGLONG> *pcbBytes,
-                  LONGLONG cTarget, HANDLE hDone)
-        : m_pcMessages(pcMessages)
-        , m_pcbBytes(pcbBytes)
-        , m_cTarget(cTarget)
-        , m_hDone(hDone)
-    {
-    }
-    virtual ~CCountingSink() = default;
-    HRESULT STDMETHODCALLTYPE QueryInterface(REFIID, void **ppv) override
-    {
-        *ppv = nullptr;
-        return E_NOINTERFACE;
-    }
-    ULONG STDMETHODCALLTYPE AddRef() override { return InterlockedIncrement(&m_cRef); }
-    ULONG STDMETHODCALLTYPE Release() override
-    {
-        ULONG cRef = InterlockedDecrement(&m_cRef);
-        if (cRef == 0)
-        {
-            delete this;
-        }
-        return cRef;
-    }
-    HRESULT STDMETHODCALLTYPE IncomingMessage(const BYTE *, ULONG cb) override
-    {
-        *m_pcbBytes += cb;
-        if (++*m_pcMessages == m_cTarget)
-        {
-            SetEvent(m_hDone);
-        }
-        return S_OK;
-    }
-    HRESULT STDMETHODCALLTYPE PipeBroken() override { return S_OK; }
-    HRESULT STDMETHODCALLTYPE Connected() override { return S_OK; }
-
-private:
-    volatile LONG m_cRef = 1;
-    std::atomic<LONGLONG> *m_pcMessages;
-    std::atomic<LONGLONG> *m_pcbBytes;
-    LONGLONG m_cTarget;
-    HANDLE m_hDone;
-};
 
 // A plain client: opens the pipe (retrying while no instance listens) and writes its
 // messages with blocking calls.
@@ -164,7 +117,7 @@ Figures BenchAsyncPipe(int iRun, int cClients, int cMessagesPerClient, DWORD cbM
     std::vector<AsyncPipe *> pipes;
     for (int c = 0; c < cClients; c++)
     {
-        CCountingSink *pSink = new CCountingSink(&cMessages, &cbBytes, cTarget, hDone);
+        CBenchCountingSink *pSink = new CBenchCountingSink(&cMessages, &cbBytes, cTarget, hDone);
         AsyncPipe *pPipe = new AsyncPipe();
         pPipe->Listen(name.c_str(), pSink, pSink);
         pSink->Release();

@@ -4,6 +4,7 @@
 // document and handing it to the same file sink, in the same run. Prints MB/s (10^6 bytes of
 // trace text per second, best of five rounds of at least 0.5 s), the ratios, and where our
 // time goes. Sets the two delivery values of the prefix for the run and puts them back.
+#include "bench/benchsupport.h"
 #include "lib/cjsonobject.h"
 #include "lib/jsonvalidator.h"
 #include "service/ctracedocument.h"
@@ -26,35 +27,13 @@ typedef std::chrono::steady_clock Clock;
 const ULONG c_cGroups = 100;
 const ULONG c_cRecords = 100;
 
-const GUID c_guidActivity = {
-    0x6f1d2a40, 0x3c1e, 0x4b7a, {0x9d, 0x55, 0x1a, 0x2b, 0x3c, 0x4d, 0x5e, 0x6f}};
-const GUID c_guidSession = {
-    0x0a1b2c3d, 0x4e5f, 0x6071, {0x82, 0x93, 0xa4, 0xb5, 0xc6, 0xd7, 0xe8, 0xf9}};
-const GUID c_guidLog = {
-    0x12345678, 0x9abc, 0xdef0, {0x12, 0x34, 0x56, 0x78, 0x9a, 0xbc, 0xde, 0xf0}};
-
 const wchar_t c_wszPreferenceKey[] =
     L"System\\CurrentControlSet\\Services\\Ambrel\\Parameters\\CrowdsrcPlugin";
 const wchar_t c_wszTestKey[] = L"System\\CurrentControlSet\\Services\\Telvane\\Parameters";
 
-// An activity event as a client sends it: a JSON object of exactly 200 bytes and its NUL.
-std::string RecordValue(ULONG i)
-{
-    char szValue[256];
-    int cch = snprintf(szValue, sizeof(szValue),
-                       "{\"Event\":\"Connect\",\"Bssid\":\"00:11:22:33:%02x:%02x\",\"Rssi\":-%lu,"
-                       "\"Channel\":%lu,\"Band\":\"5GHz\",\"Reason\":0,\"Detail\":\"",
-                       static_cast<unsigned>(i & 0xFF), static_cast<unsigned>((i >> 8) & 0xFF),
-                       40 + i % 50, 1 + i % 13);
-    std::string str(szValue, static_cast<size_t>(cch));
-    str.append(200 - str.size() - 2, 'x');
-    str += "\"}";
-    return str;
-}
-
 GUID GroupId(ULONG g)
 {
-    GUID guid = c_guidLog;
+    GUID guid = c_guidBenchLog;
     guid.Data1 = g;
     return guid;
 }
@@ -142,7 +121,7 @@ double MegabytesPerSecond(size_t cbPerRun, const std::function<void()> &work)
 void DeliverThroughTheSteps(const std::vector<std::string> &rgValues)
 {
     CTraceDocument document;
-    document.Begin(c_guidActivity, c_guidSession, c_guidLog);
+    document.Begin(c_guidBenchActivity, c_guidBenchSession, c_guidBenchLog);
     for (ULONG g = 0; g < c_cGroups; g++)
     {
         GUID id = GroupId(g);
@@ -179,13 +158,13 @@ template <class Writer>
 void WriteHeader(Writer &writer, const Header &header)
 {
     writer.Key("ActivityID");
-    writer.String(GuidToString(c_guidActivity).c_str());
+    writer.String(GuidToString(c_guidBenchActivity).c_str());
     writer.Key("SessionID");
-    writer.String(GuidToString(c_guidSession).c_str());
+    writer.String(GuidToString(c_guidBenchSession).c_str());
     writer.Key("JsonVersion");
     writer.Uint(24);
     writer.Key("LogID");
-    writer.String(GuidToString(c_guidLog).c_str());
+    writer.String(GuidToString(c_guidBenchLog).c_str());
     writer.Key("WiFiConnID");
     writer.String(header.strConnId.c_str());
     writer.Key("LogCount");
@@ -331,7 +310,7 @@ int main()
     std::vector<std::string> rgValues;
     for (ULONG r = 0; r < c_cRecords; r++)
     {
-        rgValues.push_back(RecordValue(r));
+        rgValues.push_back(BenchRecordValue(r));
     }
     std::vector<std::string> rgGroupKeys;
     for (ULONG g = 0; g < c_cGroups; g++)
@@ -345,7 +324,7 @@ int main()
     GetVersionExW(&header.version);
     {
         CTraceDocument probe;
-        probe.Begin(c_guidActivity, c_guidSession, c_guidLog);
+        probe.Begin(c_guidBenchActivity, c_guidBenchSession, c_guidBenchLog);
         std::string strProbe = probe.CurrentText();
         rapidjson::Document parsed;
         parsed.Parse(strProbe.c_str());
@@ -410,7 +389,7 @@ int main()
     double dblBegin = SecondsOf(
         [&] {
             CTraceDocument document;
-            document.Begin(c_guidActivity, c_guidSession, c_guidLog);
+            document.Begin(c_guidBenchActivity, c_guidBenchSession, c_guidBenchLog);
         },
         7);
     // Records alone: the document of each run is deleted outside the measured time.
@@ -419,7 +398,7 @@ int main()
     for (int i = 0; i < 7; i++)
     {
         CTraceDocument *pDocument = new CTraceDocument();
-        pDocument->Begin(c_guidActivity, c_guidSession, c_guidLog);
+        pDocument->Begin(c_guidBenchActivity, c_guidBenchSession, c_guidBenchLog);
         Clock::time_point start = Clock::now();
         for (ULONG g = 0; g < c_cGroups; g++)
         {

@@ -9,24 +9,9 @@
 
 namespace
 {
-#define SUBMISSION_KEY L"Software\\Telvane\\Standins\\Submission" // as in the control
-
 // Written by the default constructor into the library's bytes; a profile without it was
 // not prepared by this library.
 const BYTE c_rgbProfileSignature[8] = {'C', 'S', 'P', 'R', 'O', 'F', 1, 0};
-
-// The code a call is told to return; read at every call, so a change applies at once.
-DWORD ConfiguredResult(const wchar_t *wszValue)
-{
-    DWORD dwValue = 0;
-    DWORD cb = sizeof(dwValue);
-    if (RegGetValueW(HKEY_LOCAL_MACHINE, SUBMISSION_KEY, wszValue, RRF_RT_REG_DWORD, nullptr,
-                     &dwValue, &cb) != ERROR_SUCCESS)
-    {
-        return 0;
-    }
-    return dwValue;
-}
 
 std::string Code(DWORD dw)
 {
@@ -154,7 +139,7 @@ CrowdsourcingDataSubmitter_t::~CrowdsourcingDataSubmitter_t()
 
 DWORD CrowdsourcingDataSubmitter_t::Init()
 {
-    DWORD dwResult = ConfiguredResult(L"InitResult");
+    DWORD dwResult = SubmissionGetResult(L"InitResult");
     const CrowdsourcingProfile_t *pProfile =
         reinterpret_cast<const CrowdsourcingProfile_t *>(m_rgbProfile);
     if (dwResult == 0 && (memcmp(pProfile->rgbLibraryState, c_rgbProfileSignature,
@@ -171,7 +156,7 @@ DWORD CrowdsourcingDataSubmitter_t::Init()
 
 DWORD CrowdsourcingDataSubmitter_t::SubmitData(const BYTE *pbData, DWORD cbData, const GUID *pGuid)
 {
-    DWORD dwResult = ConfiguredResult(L"SubmitResult");
+    DWORD dwResult = SubmissionGetResult(L"SubmitResult");
     if (dwResult == 0 && !m_fInitialized)
     {
         dwResult = ERROR_INVALID_STATE;

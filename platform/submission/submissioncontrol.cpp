@@ -4,7 +4,6 @@
 #include <cstring>
 #include <stdlib.h>
 
-const wchar_t c_wszSubmissionKey[] = L"Software\\Telvane\\Standins\\Submission";
 const wchar_t c_wszSubmissionInitResult[] = L"InitResult";
 const wchar_t c_wszSubmissionSubmitResult[] = L"SubmitResult";
 
@@ -206,16 +205,4 @@ bool SubmissionSetResult(const wchar_t *wszValue, DWORD dwCode)
                                         reinterpret_cast<const BYTE *>(&dwCode), sizeof(dwCode));
     RegCloseKey(hKey);
     return lStatus == ERROR_SUCCESS || (dwCode == 0 && lStatus == ERROR_FILE_NOT_FOUND);
-}
-
-DWORD SubmissionGetResult(const wchar_t *wszValue)
-{
-    DWORD dwValue = 0;
-    DWORD cb = sizeof(dwValue);
-    if (RegGetValueW(HKEY_LOCAL_MACHINE, c_wszSubmissionKey, wszValue, RRF_RT_REG_DWORD, nullptr,
-                     &dwValue, &cb) != ERROR_SUCCESS)
-    {
-        return 0;
-    }
-    return dwValue;
 }

@@ -11,7 +11,6 @@
 #include <string>
 #include <vector>
 
-extern const wchar_t c_wszSubmissionKey[];
 extern const wchar_t c_wszSubmissionInitResult[];
 extern const wchar_t c_wszSubmissionSubmitResult[];
 
@@ -38,4 +37,3 @@ void SubmissionClear();
 
 // The code Init or SubmitData returns from now on (0: success).
 bool SubmissionSetResult(const wchar_t *wszValue, DWORD dwCode);
-DWORD SubmissionGetResult(const wchar_t *wszValue);

@@ -3,6 +3,19 @@
 #include <stdio.h>
 
 const wchar_t c_wszSubmissionSuffix[] = L".sub";
+const wchar_t c_wszSubmissionKey[] = L"Software\\Telvane\\Standins\\Submission";
+
+DWORD SubmissionGetResult(const wchar_t *wszValue)
+{
+    DWORD dwValue = 0;
+    DWORD cb = sizeof(dwValue);
+    if (RegGetValueW(HKEY_LOCAL_MACHINE, c_wszSubmissionKey, wszValue, RRF_RT_REG_DWORD, nullptr,
+                     &dwValue, &cb) != ERROR_SUCCESS)
+    {
+        return 0;
+    }
+    return dwValue;
+}
 
 std::wstring SubmissionSpoolDirectory()
 {

@@ -20,6 +20,11 @@ std::wstring SubmissionSpoolDirectory();
 // Creates the spool folder and its parents; false when that fails.
 bool SubmissionCreateSpoolDirectory();
 
+// Where the control keeps the codes the library's calls are told to return.
+extern const wchar_t c_wszSubmissionKey[];
+// The code a call named wszValue ("InitResult", "SubmitResult") is told to return; 0 when none.
+DWORD SubmissionGetResult(const wchar_t *wszValue);
+
 // Final names end in this; a file being written ends in ".tmp" instead.
 extern const wchar_t c_wszSubmissionSuffix[];
 
