@@ -78,41 +78,6 @@ TEST_F(StandInTest, GetPhoneBuildInfoFailsWithANegativeResultAndLeavesTheRecord)
     EXPECT_EQ(S_OK, GetPhoneBuildInfo(&untouched));
 }
 
-TEST_F(StandInTest, TheSpoolKeepsEachAcceptedSubmissionWhole)
-{
-    // {9e2b3c4d-5f60-4718-89a0-b1c2d3e4f506}
-    const GUID guid = {
-        0x9e2b3c4d, 0x5f60, 0x4718, {0x89, 0xa0, 0xb1, 0xc2, 0xd3, 0xe4, 0xf5, 0x06}};
-    std::string strData("binary\0data\r\n\xff", 15);
-    {
-        CrowdsourcingProfile_t profile;
-        FillProfile(profile, L"Other_Profile");
-        CrowdsourcingDataSubmitter_t submitter(profile, L"https://upload", 7, nullptr);
-        EXPECT_EQ(0u, submitter.Init());
-        EXPECT_EQ(0u, submitter.SubmitData(reinterpret_cast<const BYTE *>(strData.data()),
-                                           static_cast<DWORD>(strData.size()), &guid));
-        EXPECT_EQ(0u, submitter.SubmitData(nullptr, 0, nullptr));
-    }
-    std::vector<SUBMISSION_RECORD> rgRecords = SubmissionList();
-    ASSERT_EQ(2u, rgRecords.size());
-    // Newest first.
-    EXPECT_EQ("", rgRecords[0].strData);
-    EXPECT_EQ("null", rgRecords[0].strGuid);
-    const SUBMISSION_RECORD &record = rgRecords[1];
-    EXPECT_EQ(strData, record.strData);
-    EXPECT_EQ("Other_Profile", record.strProfileName);
-    EXPECT_EQ("https://upload 7 null", record.strTarget);
-    EXPECT_EQ("9e2b3c4d-5f60-4718-89a0-b1c2d3e4f506", record.strGuid);
-    EXPECT_EQ(8u, record.rgdwSettings[7]);
-    EXPECT_LE(rgRecords[1].ullSubmitted, rgRecords[0].ullSubmitted);
-
-    // Only complete files count: a temporary one or a cut one is not listed.
-    std::wstring wstrCut = record.wstrPath.substr(0, record.wstrPath.size() - 4) + L"0.sub";
-    std::string strFile = testsupport::ReadFileText(record.wstrPath);
-    ASSERT_TRUE(testsupport::WriteFileText(wstrCut, strFile.substr(0, strFile.size() - 1)));
-    EXPECT_EQ(2u, SubmissionList().size());
-}
-
 TEST_F(StandInTest, TheSubmitterRefusesMisuseAndObeysItsFailureSwitches)
 {
     struct Row
