@@ -198,7 +198,7 @@ TEST(Synchronizer, ConcurrentPostersNeverOverlapAndKeepTheirOrder)
     pObject->Release();
 }
 
-TEST(Synchronizer, PostsToSelfRunAfterTheHandlerInOrderOnTheSameThread)
+TEST(Synchronizer, PostsToSelfRunAfterTheHandlerPostsToOthersRunNested)
 {
     CRecorder *pObject = new CRecorder();
     pObject->Post(EventPostThreeToSelf);
@@ -210,15 +210,12 @@ TEST(Synchronizer, PostsToSelfRunAfterTheHandlerInOrderOnTheSameThread)
         EXPECT_EQ(GetCurrentThreadId(), pObject->m_rgRecords[i].dwThread);
         EXPECT_EQ(1, pObject->m_rgRecords[i].cDepth);
     }
-    pObject->Release();
-}
 
-TEST(Synchronizer, PostToAnotherIdleObjectRunsNested)
-{
-    CRecorder *pFirst = new CRecorder();
+    // A post to another idle object runs nested: its handler had run by the time its Post
+    // returned inside ours.
+    CRecorder *pFirst = pObject;
     CRecorder *pSecond = new CRecorder();
     pFirst->Post(EventPostToOther, reinterpret_cast<ULONG_PTR>(pSecond));
-    // The other object's handler had run by the time its Post returned inside ours.
     EXPECT_EQ(1u, pFirst->m_cOtherRecordsAfterPost);
     ASSERT_EQ(1u, pSecond->m_rgRecords.size());
     EXPECT_EQ(GetCurrentThreadId(), pSecond->m_rgRecords[0].dwThread);
