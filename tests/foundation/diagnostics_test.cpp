@@ -67,7 +67,7 @@ TEST(DebugLog, PrefixFormatCutAndQuiet)
     EXPECT_EQ(L'z', lines[1].back());
 }
 
-TEST(FatalError, ReportTextWithAndWithoutSystemMessage)
+TEST(FatalError, ReportTextWithAndWithoutSystemMessageAndFailedChecks)
 {
     FailureCapture failures;
     LogCapture log;
@@ -82,17 +82,13 @@ TEST(FatalError, ReportTextWithAndWithoutSystemMessage)
         L"Element not found."));
     EXPECT_TRUE(log.Contains(L"service/cthing.cpp(43): Fatal error 0x2f7d from WinHttpSendRequest: "
                              L"(unknown error code)\r\n"));
-}
 
-TEST(Assert, CheckReportsOnlyFalseConditions)
-{
-    FailureCapture failures;
-    LogCapture log;
+    // A check reports only a false condition.
     int cValue = 1;
     ASSERT_CHECK(L"Tests::Check", cValue == 1);
-    EXPECT_EQ(0u, failures.Count());
+    EXPECT_EQ(2u, failures.Count());
     ASSERT_CHECK(L"Tests::Check", cValue == 2);
-    ASSERT_EQ(1u, failures.Count());
+    ASSERT_EQ(3u, failures.Count());
     EXPECT_TRUE(log.Contains(L"Tests::Check: "));
     EXPECT_TRUE(log.Contains(L"diagnostics_test.cpp("));
     EXPECT_TRUE(log.Contains(L"): Assertion failure: cValue == 2\r\n"));
