@@ -1,12 +1,14 @@
-// The misuse the two stand-ins refuse as the phone's libraries do. The service's own calls
-// never commit it (the trace document and sink tests drive those), so only these calls show
-// that a faulty service would be caught. Runs on the test thread.
+// The misuse the two stand-ins refuse as the phone's libraries do (the service's own calls,
+// which the trace document and sink tests drive, never commit it, so only these calls show a
+// faulty service would be caught), and the spool that tests and telvanectl read. Runs on the
+// test thread.
 #include "platform/deviceinfo/deviceinfo.h"
 #include "platform/submission/submission.h"
 #include "tests/trace/deliverystate.h"
 
 #include <cwchar>
 #include <string>
+#include <vector>
 
 using StandInTest = tracetest::CDeliveryTest;
 
@@ -46,4 +48,37 @@ TEST_F(StandInTest, MisuseIsRefused)
                   submitter.SubmitData(reinterpret_cast<const BYTE *>("{}"), 2, nullptr));
     }
     EXPECT_TRUE(SubmissionList().empty());
+}
+
+TEST_F(StandInTest, TheSpoolKeepsEachAcceptedSubmissionWholeNewestFirst)
+{
+    std::string strData("binary\0data\r\n\xff", 15);
+    {
+        CrowdsourcingProfile_t profile;
+        wcscpy(profile.wszProfileName, L"Other_Profile");
+        profile.rgdwSettings[7] = 8;
+        CrowdsourcingDataSubmitter_t submitter(profile, L"https://upload", 7, nullptr);
+        EXPECT_EQ(0u, submitter.Init());
+        EXPECT_EQ(0u,
+                  submitter.SubmitData(reinterpret_cast<const BYTE *>(strData.data()),
+                                       static_cast<DWORD>(strData.size()), &tracetest::c_guidLog));
+        EXPECT_EQ(0u, submitter.SubmitData(nullptr, 0, nullptr));
+    }
+    std::vector<SUBMISSION_RECORD> rgRecords = SubmissionList();
+    ASSERT_EQ(2u, rgRecords.size());
+    EXPECT_EQ("", rgRecords[0].strData);
+    EXPECT_EQ("null", rgRecords[0].strGuid);
+    const SUBMISSION_RECORD &record = rgRecords[1];
+    EXPECT_EQ(strData, record.strData);
+    EXPECT_EQ("Other_Profile", record.strProfileName);
+    EXPECT_EQ("https://upload 7 null", record.strTarget);
+    EXPECT_EQ(testsupport::GuidText(tracetest::c_guidLog), record.strGuid);
+    EXPECT_EQ(8u, record.rgdwSettings[7]);
+    EXPECT_LE(rgRecords[1].ullSubmitted, rgRecords[0].ullSubmitted);
+
+    // Only complete files count: a temporary one or a cut one is not listed.
+    std::wstring wstrCut = record.wstrPath.substr(0, record.wstrPath.size() - 4) + L"0.sub";
+    std::string strFile = testsupport::ReadFileText(record.wstrPath);
+    ASSERT_TRUE(testsupport::WriteFileText(wstrCut, strFile.substr(0, strFile.size() - 1)));
+    EXPECT_EQ(2u, SubmissionList().size());
 }
