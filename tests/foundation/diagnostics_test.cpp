@@ -40,15 +40,20 @@ TEST(StringCchPrintf, BoundsAndResults)
     EXPECT_EQ('\0', sz[0]);
 }
 
-TEST(DebugLog, PrefixFormatAndCut)
+TEST(DebugLog, PrefixFormatCutAndQuiet)
 {
     LogCapture log;
     DebugLog(L"CService::SetStatus", L"%s is %s\r\n", L"Telvane", L"RUNNING");
     std::wstring longMessage(3000, L'z');
     DebugLog(L"Long", L"%s\r\n", longMessage.c_str());
+    // A quiet process still hands its lines to the log hook.
+    DiagnosticsSetLogQuiet(true);
+    DebugLog(L"Tests::Quiet", L"%s\r\n", L"seen by the hook");
+    DiagnosticsSetLogQuiet(false);
 
     std::vector<std::wstring> lines = log.Lines();
-    ASSERT_EQ(2u, lines.size());
+    ASSERT_EQ(3u, lines.size());
+    EXPECT_TRUE(log.Contains(L"Tests::Quiet: seen by the hook\r\n"));
     const std::wstring &line = lines[0];
     // [hh:mm:ss] CService::SetStatus: Telvane is RUNNING\r\n
     ASSERT_GE(line.size(), 11u);
@@ -62,7 +67,7 @@ TEST(DebugLog, PrefixFormatAndCut)
     EXPECT_EQ(L'z', lines[1].back());
 }
 
-TEST(FatalError, ReportTextWithAndWithoutSystemMessage)
+TEST(FatalError, ReportTextWithAndWithoutSystemMessageAndFailedChecks)
 {
     FailureCapture failures;
     LogCapture log;
@@ -77,17 +82,13 @@ TEST(FatalError, ReportTextWithAndWithoutSystemMessage)
         L"Element not found."));
     EXPECT_TRUE(log.Contains(L"service/cthing.cpp(43): Fatal error 0x2f7d from WinHttpSendRequest: "
                              L"(unknown error code)\r\n"));
-}
 
-TEST(Assert, CheckReportsOnlyFalseConditions)
-{
-    FailureCapture failures;
-    LogCapture log;
+    // A check reports only a false condition.
     int cValue = 1;
     ASSERT_CHECK(L"Tests::Check", cValue == 1);
-    EXPECT_EQ(0u, failures.Count());
+    EXPECT_EQ(2u, failures.Count());
     ASSERT_CHECK(L"Tests::Check", cValue == 2);
-    ASSERT_EQ(1u, failures.Count());
+    ASSERT_EQ(3u, failures.Count());
     EXPECT_TRUE(log.Contains(L"Tests::Check: "));
     EXPECT_TRUE(log.Contains(L"diagnostics_test.cpp("));
     EXPECT_TRUE(log.Contains(L"): Assertion failure: cValue == 2\r\n"));
@@ -126,13 +127,4 @@ TEST(FailFast, FatalErrorAndAssertEndTheProcessQuietOrNot)
             EXPECT_EQ(c.szOutputPart, result.strOutput);
         }
     }
-}
-
-TEST(DebugLog, QuietLinesStillReachTheLogHook)
-{
-    LogCapture log;
-    DiagnosticsSetLogQuiet(true);
-    DebugLog(L"Tests::Quiet", L"%s\r\n", L"seen by the hook");
-    DiagnosticsSetLogQuiet(false);
-    EXPECT_TRUE(log.Contains(L"Tests::Quiet: seen by the hook\r\n"));
 }

@@ -67,7 +67,7 @@ std::string Bytes(const void *pv, size_t cb)
 }
 } // namespace
 
-TEST_F(EventTraceTest, EnableCallbackSetsBitsByLevelAndKeyword)
+TEST_F(EventTraceTest, EnableCallbackSetsBitsAndOnlyEnabledEventsAreWritten)
 {
     using Bits3 = std::vector<bool>;
     EXPECT_EQ(Bits3({false, false, false}), Bits());
@@ -91,6 +91,20 @@ TEST_F(EventTraceTest, EnableCallbackSetsBitsByLevelAndKeyword)
 
     Session(EVENT_CONTROL_CODE_DISABLE_PROVIDER, 0, 0, 0);
     EXPECT_EQ(Bits3({false, false, false}), Bits());
+    // Without a session nothing is written; keyword 0x400 alone enables the UDP failures.
+    TelvaneTrace("x");
+    TelvaneTraceF("%d", 1);
+    TelvaneTraceFailure("x", 1);
+    TelvaneTraceUdpFailure("x", 1);
+    TelvaneTraceMark(TelvaneEvent_UdpConfigRead);
+    TelvaneTraceCommandLine(L"x");
+    EXPECT_TRUE(s_rgEvents.empty());
+    Session(EVENT_CONTROL_CODE_ENABLE_PROVIDER, 0, 0x400, 0);
+    TelvaneTrace("x");
+    TelvaneTraceFailure("x", 1);
+    TelvaneTraceUdpFailure("y", 1);
+    ASSERT_EQ(1u, s_rgEvents.size());
+    EXPECT_EQ(2001, s_rgEvents[0].usId);
 }
 
 TEST_F(EventTraceTest, PayloadsAndDescriptors)
@@ -131,25 +145,6 @@ TEST_F(EventTraceTest, PayloadsAndDescriptors)
     EXPECT_EQ(2008, s_rgEvents[6].usId);
     EXPECT_EQ(std::vector<std::string>{Bytes(L"a b", 8)}, s_rgEvents[6].rgPayload);
     EXPECT_EQ(std::vector<std::string>{Bytes(L"NULL", 10)}, s_rgEvents[7].rgPayload);
-}
-
-TEST_F(EventTraceTest, NothingIsWrittenWithoutASession)
-{
-    TelvaneTrace("x");
-    TelvaneTraceF("%d", 1);
-    TelvaneTraceFailure("x", 1);
-    TelvaneTraceUdpFailure("x", 1);
-    TelvaneTraceMark(TelvaneEvent_UdpConfigRead);
-    TelvaneTraceCommandLine(L"x");
-    EXPECT_TRUE(s_rgEvents.empty());
-
-    // A session for keyword 0x400 only enables the UDP failures.
-    Session(EVENT_CONTROL_CODE_ENABLE_PROVIDER, 0, 0x400, 0);
-    TelvaneTrace("x");
-    TelvaneTraceFailure("x", 1);
-    TelvaneTraceUdpFailure("y", 1);
-    ASSERT_EQ(1u, s_rgEvents.size());
-    EXPECT_EQ(2001, s_rgEvents[0].usId);
 }
 
 TEST(EventTraceRegistration, RegistersOnceAndUnregistersOnce)

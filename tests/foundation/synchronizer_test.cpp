@@ -198,7 +198,7 @@ TEST(Synchronizer, ConcurrentPostersNeverOverlapAndKeepTheirOrder)
     pObject->Release();
 }
 
-TEST(Synchronizer, PostsToSelfRunAfterTheHandlerInOrderOnTheSameThread)
+TEST(Synchronizer, PostsToSelfRunAfterTheHandlerToOthersNestedUnknownOnesAreFatal)
 {
     CRecorder *pObject = new CRecorder();
     pObject->Post(EventPostThreeToSelf);
@@ -210,19 +210,24 @@ TEST(Synchronizer, PostsToSelfRunAfterTheHandlerInOrderOnTheSameThread)
         EXPECT_EQ(GetCurrentThreadId(), pObject->m_rgRecords[i].dwThread);
         EXPECT_EQ(1, pObject->m_rgRecords[i].cDepth);
     }
-    pObject->Release();
-}
 
-TEST(Synchronizer, PostToAnotherIdleObjectRunsNested)
-{
-    CRecorder *pFirst = new CRecorder();
+    // A post to another idle object runs nested: its handler had run by the time its Post
+    // returned inside ours.
+    CRecorder *pFirst = pObject;
     CRecorder *pSecond = new CRecorder();
     pFirst->Post(EventPostToOther, reinterpret_cast<ULONG_PTR>(pSecond));
-    // The other object's handler had run by the time its Post returned inside ours.
     EXPECT_EQ(1u, pFirst->m_cOtherRecordsAfterPost);
     ASSERT_EQ(1u, pSecond->m_rgRecords.size());
     EXPECT_EQ(GetCurrentThreadId(), pSecond->m_rgRecords[0].dwThread);
     EXPECT_EQ(9u, pSecond->m_rgRecords[0].ulSequence);
+
+    // An event no handler knows is a fatal error naming the handler.
+    FailureCapture failures;
+    pFirst->Post(77);
+    ASSERT_EQ(1u, failures.Count());
+    EXPECT_TRUE(
+        failures.Contains(L"CRecorder::Dispatch: Fatal error 0x4d from CRecorder::EventType %u"))
+        << testsupport::Narrow(failures.Lines()[0]);
     pFirst->Release();
     pSecond->Release();
 }
@@ -248,16 +253,4 @@ TEST(Synchronizer, ObjectDeletedByTheReleaseAfterItsLastEvent)
     EXPECT_TRUE(s_fWatchedFreed.load());
     WatchDelete(nullptr);
     EXPECT_EQ(0u, failures.Count());
-}
-
-TEST(Synchronizer, UnknownEventIsFatal)
-{
-    FailureCapture failures;
-    CRecorder *pObject = new CRecorder();
-    pObject->Post(77);
-    ASSERT_EQ(1u, failures.Count());
-    EXPECT_TRUE(
-        failures.Contains(L"CRecorder::Dispatch: Fatal error 0x4d from CRecorder::EventType %u"))
-        << testsupport::Narrow(failures.Lines()[0]);
-    pObject->Release();
 }

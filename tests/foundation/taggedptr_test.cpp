@@ -52,7 +52,7 @@ private:
 
 TAGGED_PTR_CLASS_NAME(CCounted);
 
-TEST(TaggedRefCount, LastReleaseOfAnyTagDeletes)
+TEST(TaggedRefCount, LastReleaseOfAnyTagDeletesReleaseUnderAnUnusedTagIsFatal)
 {
     bool fDeleted = false;
     CCounted *p = new CCounted(&fDeleted);
@@ -65,13 +65,10 @@ TEST(TaggedRefCount, LastReleaseOfAnyTagDeletes)
     EXPECT_EQ(1u, p->Release(30));
     EXPECT_EQ(0u, p->Release(30));
     EXPECT_TRUE(fDeleted);
-}
 
-TEST(TaggedRefCount, ReleaseUnderUnusedTagIsFatal)
-{
     FailureCapture failures;
-    bool fDeleted = false;
-    CCounted *p = new CCounted(&fDeleted);
+    fDeleted = false;
+    p = new CCounted(&fDeleted);
     p->AddRef(4);
     p->Release(5); // wrong holder: reported, and (as under a debugger) the total still falls
     ASSERT_EQ(1u, failures.Count());

@@ -7,6 +7,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstring>
 #include <string>
 
 using testsupport::FailureCapture;
@@ -41,37 +42,6 @@ std::string Json(IJsonObject *pObject)
 const GUID c_guidSample = {
     0x01234567, 0x89AB, 0xCDEF, {0x01, 0x23, 0x45, 0x67, 0x89, 0xAB, 0xCD, 0xEF}};
 } // namespace
-
-TEST(CJsonObject, BuildersAndGetJson)
-{
-    CJsonObject *pObject = new CJsonObject();
-    EXPECT_EQ("{}", Json(pObject));
-    LPSTR szText = nullptr;
-    DWORD cbText = 0;
-    EXPECT_EQ(E_POINTER, pObject->GetJson(nullptr, &cbText));
-    EXPECT_EQ(E_POINTER, pObject->GetJson(&szText, nullptr));
-
-    EXPECT_EQ(S_OK, pObject->AddDword("d", 4000000000u));
-    EXPECT_EQ(S_OK, pObject->AddUlonglong("t", 133000000000000000ull));
-    EXPECT_EQ(S_OK, pObject->AddDouble("x", 6.0));
-    EXPECT_EQ(S_OK, pObject->AddBool("b", true));
-    EXPECT_EQ(S_OK, pObject->AddString("w", L"wide/\x00e9"));
-    EXPECT_EQ(S_OK, pObject->AddString("n", "narrow\n"));
-    EXPECT_EQ(S_OK, pObject->AddGuid("g", c_guidSample));
-    EXPECT_EQ(S_OK, pObject->AddRawJson("r", "[1, 2]", 0));
-    EXPECT_EQ(E_POINTER, pObject->AddString("none", static_cast<LPCWSTR>(nullptr)));
-    EXPECT_EQ(E_POINTER, pObject->AddString(L"none", static_cast<LPCSTR>(nullptr)));
-    EXPECT_EQ(E_POINTER, pObject->AddRawJson("none", nullptr, 0));
-    EXPECT_EQ(E_POINTER, pObject->AddObject("none", nullptr));
-    EXPECT_EQ(E_POINTER, pObject->AddArray("none", nullptr));
-    const std::string strExpected =
-        "{\"d\":4000000000,\"t\":133000000000000000,\"x\":6,\"b\":true,"
-        "\"w\":\"wide\\/\\u00e9\",\"n\":\"narrow\\n\",\"g\":\"01234567-89ab-cdef-0123-"
-        "456789abcdef\",\"r\":[1, 2]}";
-    EXPECT_EQ(strExpected, Json(pObject));
-    EXPECT_EQ(strExpected, Text(pObject));
-    EXPECT_EQ(0u, pObject->Release());
-}
 
 TEST(CJsonObject, WideTextConvertsOrBecomesError)
 {
@@ -121,10 +91,20 @@ TEST(CJsonObject, AddObjectTakesTheChildTextAtThatMoment)
     EXPECT_EQ(0u, pParent->Release());
 }
 
-TEST(CJsonObject, QueryInterfaceAndSlotOrder)
+TEST(CJsonObject, QueryInterfaceSlotOrderBuildersAndGetJson)
 {
     CJsonObject *pObject = new CJsonObject();
     IJsonObject *pInterface = pObject;
+    EXPECT_EQ("{}", Json(pObject));
+    LPSTR szText = nullptr;
+    DWORD cbText = 0;
+    EXPECT_EQ(E_POINTER, pObject->GetJson(nullptr, &cbText));
+    EXPECT_EQ(E_POINTER, pObject->GetJson(&szText, nullptr));
+    EXPECT_EQ(E_POINTER, pObject->AddString("none", static_cast<LPCWSTR>(nullptr)));
+    EXPECT_EQ(E_POINTER, pObject->AddString(L"none", static_cast<LPCSTR>(nullptr)));
+    EXPECT_EQ(E_POINTER, pObject->AddRawJson("none", nullptr, 0));
+    EXPECT_EQ(E_POINTER, pObject->AddObject("none", nullptr));
+    EXPECT_EQ(E_POINTER, pObject->AddArray("none", nullptr));
 
     void *pv = nullptr;
     EXPECT_EQ(S_OK, pInterface->QueryInterface(IID_IUnknown, &pv));
@@ -174,13 +154,24 @@ TEST(CJsonObject, QueryInterfaceAndSlotOrder)
     EXPECT_EQ(S_OK, reinterpret_cast<PFN_STR>(rgpfn[6])(pInterface, L"narrow", "n"));
     EXPECT_EQ(S_OK, reinterpret_cast<PFN_OBJ>(rgpfn[7])(pInterface, L"object", pChild));
     EXPECT_EQ(S_OK, reinterpret_cast<PFN_RAW>(rgpfn[8])(pInterface, L"raw", "[7]", 4));
-    LPSTR szText = nullptr;
-    DWORD cbText = 0;
+    // The builders the service calls by narrow name.
+    EXPECT_EQ(S_OK, pObject->AddDword("d", 4000000000u));
+    EXPECT_EQ(S_OK, pObject->AddUlonglong("t", 133000000000000000ull));
+    EXPECT_EQ(S_OK, pObject->AddDouble("x", 6.0));
+    EXPECT_EQ(S_OK, pObject->AddString("w", L"wide/\x00e9"));
+    EXPECT_EQ(S_OK, pObject->AddString("n", "narrow\n"));
+    EXPECT_EQ(S_OK, pObject->AddGuid("g", c_guidSample));
+    EXPECT_EQ(S_OK, pObject->AddRawJson("r", "[1, 2]", 0));
     ASSERT_EQ(S_OK, reinterpret_cast<PFN_GET>(rgpfn[9])(pInterface, &szText, &cbText));
-    EXPECT_EQ(std::string("{\"dword\":3,\"ulong\":4,\"wide\":\"w\",\"narrow\":\"n\","
-                          "\"object\":{\"k\":false},\"raw\":[7]}"),
-              szText);
+    const std::string strExpected =
+        "{\"dword\":3,\"ulong\":4,\"wide\":\"w\",\"narrow\":\"n\",\"object\":{\"k\":false},"
+        "\"raw\":[7],\"d\":4000000000,\"t\":133000000000000000,\"x\":6,\"w\":\"wide\\/"
+        "\\u00e9\",\"n\":\"narrow\\n\",\"g\":\"01234567-89ab-cdef-0123-456789abcdef\",\"r\":[1, "
+        "2]}";
+    EXPECT_EQ(strExpected, szText);
+    EXPECT_EQ(strlen(szText) + 1, cbText);
     CoTaskMemFree(szText);
+    EXPECT_EQ(strExpected, Text(pObject));
 
     pChild->Release();
     EXPECT_EQ(2u, pInterface->Release());

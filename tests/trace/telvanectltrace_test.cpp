@@ -50,14 +50,14 @@ void DeliverTwoLogs()
 }
 } // namespace
 
-TEST_F(TelvanectlTraceTest, ListShowsFilesAndSubmissionsNewestFirstAndSkipsPartialFiles)
+TEST_F(TelvanectlTraceTest, ListAndShowFindFilesAndSubmissionsAndSkipPartialFiles)
 {
     DeliverTwoLogs();
     // A file still being written under its temporary name is not a trace yet.
-    ASSERT_TRUE(WriteFileText(std::wstring(c_wszTraceFolder) +
-                                  L"\\00000000-0000-0000-0000-000000000001" +
-                                  TraceSinks::c_wszTemporarySuffix,
-                              "{\"Log"));
+    const std::wstring wstrPartial = std::wstring(c_wszTraceFolder) +
+                                     L"\\00000000-0000-0000-0000-000000000001" +
+                                     TraceSinks::c_wszTemporarySuffix;
+    ASSERT_TRUE(WriteFileText(wstrPartial, "{\"Log"));
 
     ChildResult result = Ctl(L"trace list");
     EXPECT_EQ(0u, result.dwExitCode) << result.strOutput;
@@ -71,18 +71,15 @@ TEST_F(TelvanectlTraceTest, ListShowsFilesAndSubmissionsNewestFirstAndSkipsParti
     size_t posLast = result.strOutput.rfind(" 2 true");
     EXPECT_NE(std::string::npos, posFirst) << result.strOutput;
     EXPECT_LT(posLast, posFirst) << result.strOutput;
-}
 
-TEST_F(TelvanectlTraceTest, ShowPrintsTheSummaryAndTheIndentedTrace)
-{
-    DeliverTwoLogs();
+    DeleteFileW(wstrPartial.c_str());
     std::vector<std::wstring> rgNames = FileNames(c_wszTraceFolder);
     ASSERT_EQ(2u, rgNames.size());
 
     // By LogID: every log of the run, in LogCount order (the second twice: file and
     // submission).
     std::string strLogId = GuidText(c_guidLog);
-    ChildResult result = Ctl(L"trace show " + Widen(strLogId));
+    result = Ctl(L"trace show " + Widen(strLogId));
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
     EXPECT_EQ(3u, Count(result.strOutput, "Trace C:\\")) << result.strOutput;
     EXPECT_EQ(1u, Count(result.strOutput, "LogCount       1   LogEnd false")) << result.strOutput;

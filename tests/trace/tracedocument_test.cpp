@@ -241,6 +241,7 @@ TEST_F(TraceDocumentTest, ValuesThatAreNotJsonBecomeStrings)
         {"Connected", false, "\"Connected\""},
         {"\"caf\xE9\"", false, "\"\\\"caf\\u00e9\\\"\""},
         {"[\"\\ud800\"]", false, "\"[\\\"\\\\ud800\\\"]\""},
+        {"[\"\\udc00\"]", false, "\"[\\\"\\\\udc00\\\"]\""}, // RapidJSON takes it, we do not
     };
     AllowDelivery(1);
     CTraceSession session;

@@ -333,7 +333,7 @@ protected:
 };
 } // namespace
 
-TEST_F(TraceFileWriteTest, AReaderSeesOnlyTheTemporaryNameUntilTheFileIsComplete)
+TEST_F(TraceFileWriteTest, ReadersSeeOnlyCompleteFilesAndFailedWritesLeaveNone)
 {
     FlushOneLog();
     std::vector<SUBMISSION_RECORD> rgSubmissions = SubmissionList();
@@ -352,10 +352,9 @@ TEST_F(TraceFileWriteTest, AReaderSeesOnlyTheTemporaryNameUntilTheFileIsComplete
     EXPECT_EQ(Narrow(rgNames[0]), GuidText(ParseGuid(Narrow(rgNames[0]).c_str())));
     EXPECT_EQ(rgSubmissions[0].strData,
               ReadFileText(std::wstring(c_wszTraceFolder) + L"\\" + rgNames[0]));
-}
 
-TEST_F(TraceFileWriteTest, AFailedWriteLeavesNoFileAndTheSubmissionStillHappens)
-{
+    // A failed write leaves no file, and the submission still happens.
+    DeleteFileW((std::wstring(c_wszTraceFolder) + L"\\" + rgNames[0]).c_str());
     struct Row
     {
         const char *szCase;
