@@ -150,20 +150,6 @@ TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
     EXPECT_EQ(0u, failures.Count());
 }
 
-TEST_F(ServiceInstall, ZeroResourceIdsStopAtTheAssertions)
-{
-    FailureCapture failures;
-    CTestService service(testsupport::UniqueName(L"TelvaneTestSvc").c_str());
-    CService::RegisterService(&service);
-    service.RegisterOneService();
-    EXPECT_EQ(2u, failures.Count());
-    EXPECT_TRUE(failures.Contains(L"Assertion failure: m_idsLocalizedName != 0"));
-    EXPECT_TRUE(failures.Contains(L"Assertion failure: m_idsDescription != 0"));
-    EXPECT_FALSE(testsupport::ServiceExists(service.ServiceName()));
-    EXPECT_EQ(0, service.m_cRegisters);
-    EXPECT_EQ(0, service.m_cUnregisters);
-}
-
 TEST_F(ServiceInstall, HostDllValuesAndGroupList)
 {
     FailureCapture failures;

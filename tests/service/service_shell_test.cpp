@@ -115,38 +115,6 @@ TEST_F(ServiceShell, ParseCommandLineTable)
     }
 }
 
-TEST_F(ServiceShell, ListHandsOutBitsAndUnlinksOnDestruction)
-{
-    CTestService first(L"First");
-    CTestService second(L"Second");
-    CTestService *pThird = new CTestService(L"Third");
-    CService::RegisterService(&first);
-    CService::RegisterService(&second);
-    CService::RegisterService(pThird);
-    EXPECT_EQ(1u, first.m_ulServiceBit);
-    EXPECT_EQ(2u, second.m_ulServiceBit);
-    EXPECT_EQ(4u, pThird->m_ulServiceBit);
-    EXPECT_EQ(pThird, CTestService::FirstService());
-
-    // The destructor unlinks the service wherever it is in the list.
-    delete pThird;
-    EXPECT_EQ(&second, CTestService::FirstService());
-    EXPECT_EQ(&first, second.m_pNextService);
-    second.UnregisterService();
-    EXPECT_EQ(&first, CTestService::FirstService());
-    // A service not in the list leaves the list alone.
-    CTestService stray(L"Stray");
-    stray.UnregisterService();
-    EXPECT_EQ(&first, CTestService::FirstService());
-
-    // Listing a service twice is refused without making the list a cycle.
-    FailureCapture failures;
-    CService::RegisterService(&first);
-    EXPECT_TRUE(failures.Contains(L"Assertion failure: s_pFirstService != pService && "
-                                  L"pService->m_pNextService == NULL"));
-    EXPECT_EQ(nullptr, first.m_pNextService);
-}
-
 TEST_F(ServiceShell, SetStatusCheckPointsAndNothingAfterStopped)
 {
     LogCapture log;
@@ -361,94 +329,6 @@ TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
     EXPECT_EQ(2, service.m_cStops);
     EXPECT_EQ(1u, failures.Count());
     EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
-}
-
-namespace
-{
-// The stop-callback thread reports STOPPED while the dispatcher is inside its own report of
-// the same service; the dispatcher's report must not end after STOPPED.
-HANDLE s_hOnStopEntered = nullptr;
-HANDLE s_hStoppedReported = nullptr;
-DWORD s_dwHandlerThread = 0;
-volatile LONG s_cInReport = 0;
-volatile LONG s_fOverlap = 0;
-volatile LONG s_fReportAfterStopped = 0;
-volatile LONG s_fStoppedReported = 0;
-
-BOOL WINAPI RaceReport(SERVICE_STATUS_HANDLE hStatus, LPSERVICE_STATUS pStatus)
-{
-    if (InterlockedIncrement(&s_cInReport) > 1)
-    {
-        InterlockedExchange(&s_fOverlap, 1);
-    }
-    if (s_fStoppedReported)
-    {
-        InterlockedExchange(&s_fReportAfterStopped, 1);
-    }
-    if (GetCurrentThreadId() == s_dwHandlerThread)
-    {
-        // Give the stop thread every chance to report in the middle of this one.
-        WaitForSingleObject(s_hOnStopEntered, c_dwWaitMs);
-        WaitForSingleObject(s_hStoppedReported, 500);
-    }
-    if (pStatus->dwCurrentState == SERVICE_STOPPED)
-    {
-        InterlockedExchange(&s_fStoppedReported, 1);
-        SetEvent(s_hStoppedReported);
-    }
-    InterlockedDecrement(&s_cInReport);
-    return TRUE;
-}
-} // namespace
-
-TEST_F(ServiceShell, ReportsNeverOverlapTheStoppedReport)
-{
-    SVCHOST_GLOBAL_DATA globals = {};
-    CTestService service(L"Racing");
-    s_hOnStopEntered = NewManualEvent();
-    s_hStoppedReported = NewManualEvent();
-    service.m_hStopEntered = s_hOnStopEntered;
-    ASSERT_EQ(0u, RunAsHosted(service, globals));
-
-    s_dwHandlerThread = GetCurrentThreadId();
-    ServiceSetStatusHook(RaceReport);
-    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
-    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
-    ServiceSetStatusHook(RecordReport);
-
-    EXPECT_EQ(1, service.m_cStops);
-    EXPECT_EQ(1, s_fStoppedReported);
-    EXPECT_EQ(0, s_fOverlap);
-    EXPECT_EQ(0, s_fReportAfterStopped);
-    CloseHandle(s_hOnStopEntered);
-    CloseHandle(s_hStoppedReported);
-}
-
-TEST_F(ServiceShell, HostEntryPointsListTheServiceOnce)
-{
-    FailureCapture failures;
-    LogCapture log;
-    CTestService service(L"Entry");
-
-    // A host that never pushes globals calls ServiceMain first: the service is listed there
-    // and runs as a host DLL without a stop callback. A name it does not serve is answered
-    // without running anything.
-    wchar_t wszUnknown[] = L"Nobody";
-    LPWSTR rgArgv[] = {wszUnknown};
-    CService::HostServiceMain(&service, L"GroupOne", 1, rgArgv);
-    EXPECT_EQ(&service, CTestService::FirstService());
-    EXPECT_TRUE(CTestService::Svchost());
-    EXPECT_STREQ(L"GroupOne", CTestService::Group());
-    EXPECT_EQ(nullptr, CTestService::Globals());
-    EXPECT_TRUE(log.Contains(L"No service named Nobody in this module"));
-    EXPECT_EQ(0, service.m_cStarts);
-
-    // Pushing after that, or twice, keeps one entry.
-    CService::HostPushServiceGlobals(&service, L"GroupOne", nullptr);
-    CService::HostPushServiceGlobals(&service, L"GroupOne", nullptr);
-    EXPECT_EQ(&service, CTestService::FirstService());
-    EXPECT_EQ(nullptr, service.m_pNextService);
-    EXPECT_EQ(0u, failures.Count());
 }
 
 namespace
