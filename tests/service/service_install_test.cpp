@@ -108,12 +108,10 @@ TEST_F(ServiceInstall, OwnProgramRecordAndFailureActions)
     ASSERT_TRUE(testsupport::ServiceReadRecord(service.ServiceName(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
     EXPECT_EQ(static_cast<DWORD>(SERVICE_DEMAND_START), record.dwStartType);
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_ERROR_NORMAL), record.dwErrorControl);
     EXPECT_EQ(wstrExe, record.wstrBinaryPath);
     std::wstring wstrIds = L"@" + wstrExe + L",-";
     EXPECT_EQ(wstrIds + std::to_wstring(service.m_idsLocalizedName), record.wstrDisplayName);
     EXPECT_EQ(wstrIds + std::to_wstring(service.m_idsDescription), record.wstrDescription);
-    EXPECT_EQ(L"LocalSystem", record.wstrStartName);
 
     std::vector<FAILURE_ACTIONS_CALL> rgCalls;
     {

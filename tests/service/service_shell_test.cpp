@@ -302,11 +302,20 @@ TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
     EXPECT_EQ(static_cast<DWORD>(SERVICE_STOPPED), Reports().back().dwState);
 
     // The next start, through ServiceMain itself (outside a service process the control
-    // handler cannot be registered: that fatal error is expected here).
+    // handler cannot be registered: that fatal error is expected here, but the status it
+    // prepares from the flags still shows; the flag that adds no accept bit is refused).
+    service.m_fAcceptPauseContinue = true;
+    service.m_fAcceptPowerEvents = true;
+    service.m_fAcceptControl = true;
     wchar_t wszName[] = L"Hosted";
     LPWSTR rgArgv[] = {wszName};
     service.ServiceMain(1, rgArgv);
     ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(startDone.Get(), c_dwWaitMs));
+    // The control manager reports the type it has on record: only here does the shell's show.
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), service.m_status.dwServiceType);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP | SERVICE_ACCEPT_PAUSE_CONTINUE |
+                                 SERVICE_ACCEPT_POWEREVENT),
+              service.m_status.dwControlsAccepted);
     HANDLE hNewStopEvent = service.m_hStopEvent;
     HANDLE hNewStopWait = service.m_hStopWait;
     ASSERT_NE(nullptr, hNewStopEvent);
@@ -327,8 +336,9 @@ TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
     // No third OnStop, and no SetEvent on the closed event.
     CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
     EXPECT_EQ(2, service.m_cStops);
-    EXPECT_EQ(1u, failures.Count());
+    EXPECT_EQ(2u, failures.Count());
     EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
+    EXPECT_TRUE(failures.Contains(L"Assertion failure: false"));
 }
 
 namespace
@@ -366,26 +376,10 @@ private:
 };
 } // namespace
 
-TEST_F(ServiceShell, ConsoleModeEndsWhenTheSelectedServicesStopThemselves)
-{
-    // Only the first is selected; the other never starts and must not keep console mode up.
-    CTestService quitter(L"Quitter", CTestService::StartMode::StopItself);
-    CTestService bystander(L"Bystander");
-    CService::RegisterService(&quitter);
-    CService::RegisterService(&bystander);
-    {
-        CConsoleThread console(quitter.m_ulServiceBit);
-        EXPECT_TRUE(console.WaitDone());
-    }
-    EXPECT_EQ(1, quitter.m_cStarts);
-    EXPECT_EQ(0, quitter.m_cStops);
-    EXPECT_EQ(0, bystander.m_cStarts);
-    EXPECT_EQ(nullptr, CTestService::ConsoleEvent());
-    // No status reaches the control manager in console mode.
-    EXPECT_TRUE(Reports().empty());
-}
-
-TEST_F(ServiceShell, ConsoleModeStopsRunningServicesOnCtrlC)
+// Console mode ends when the selected services stopped by themselves (one never selected never
+// starts); with another still running it waits for Ctrl+C, which stops that one on the console
+// thread. No status reaches the control manager in console mode.
+TEST_F(ServiceShell, ConsoleModeEndsWhenItsServicesStopOrOnCtrlC)
 {
     FailureCapture failures;
     CTestService runner(L"Runner");
@@ -393,8 +387,14 @@ TEST_F(ServiceShell, ConsoleModeStopsRunningServicesOnCtrlC)
     CService::RegisterService(&runner);
     CService::RegisterService(&quitter);
     {
+        CConsoleThread console(quitter.m_ulServiceBit);
+        EXPECT_TRUE(console.WaitDone());
+    }
+    EXPECT_EQ(1, quitter.m_cStarts);
+    EXPECT_EQ(0, runner.m_cStarts);
+    EXPECT_EQ(nullptr, CTestService::ConsoleEvent());
+    {
         CConsoleThread console(CService::c_ulServiceMask);
-        // One service stopping by itself is not the end while another runs.
         ASSERT_TRUE(testsupport::WaitUntil(
             [&] { return runner.m_status.dwCurrentState == SERVICE_RUNNING; }));
         EXPECT_FALSE(console.WaitDone(200));
@@ -404,40 +404,8 @@ TEST_F(ServiceShell, ConsoleModeStopsRunningServicesOnCtrlC)
     }
     EXPECT_EQ(1, runner.m_cStops);
     EXPECT_EQ(0, quitter.m_cStops);
+    EXPECT_TRUE(Reports().empty());
     // A late Ctrl+C after console mode closed its event is harmless.
     EXPECT_TRUE(CService::ConsoleCtrlHandler(CTRL_C_EVENT));
     EXPECT_EQ(0u, failures.Count());
-}
-
-// Outside a service process the control handler cannot be registered (a fatal error, seen
-// here as under a debugger), but the status ServiceMain prepares still shows (the wait hint
-// is read under the control manager by ServiceMainUnderScm).
-TEST_F(ServiceShell, ServiceMainPreparesTheStatusFromTheFlags)
-{
-    FailureCapture failures;
-    CTestService service(L"Flags");
-    service.m_fAcceptPauseContinue = true;
-    service.m_fAcceptPowerEvents = true;
-    service.m_fAcceptControl = true;
-    CService::RegisterService(&service);
-
-    CKernelHandle startDone(NewManualEvent());
-    service.m_hStartDone = startDone.Get();
-    wchar_t wszName[] = L"Flags";
-    LPWSTR rgArgv[] = {wszName};
-    service.ServiceMain(1, rgArgv);
-    ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(startDone.Get(), c_dwWaitMs));
-    ASSERT_EQ(static_cast<DWORD>(SERVICE_RUNNING), service.m_status.dwCurrentState);
-    EXPECT_EQ(1, service.m_cStarts);
-    // The control manager reports the type it has on record: only here does the shell's show.
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), service.m_status.dwServiceType);
-    EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP | SERVICE_ACCEPT_PAUSE_CONTINUE |
-                                 SERVICE_ACCEPT_POWEREVENT),
-              service.m_status.dwControlsAccepted);
-    // The flag that adds no accept bit is refused.
-    EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
-    EXPECT_TRUE(failures.Contains(L"Assertion failure: false"));
-    EXPECT_EQ(2u, failures.Count());
-    // No stop event without host globals.
-    EXPECT_EQ(nullptr, service.m_hStopEvent);
 }
