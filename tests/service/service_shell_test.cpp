@@ -80,6 +80,13 @@ TEST_F(ServiceShell, ParseCommandLineTable)
     CTestService beta(L"Beta");
     CService::RegisterService(&alpha);
     CService::RegisterService(&beta);
+    {
+        // Listing a service twice is refused without making the list a cycle.
+        FailureCapture failures;
+        CService::RegisterService(&alpha);
+        EXPECT_EQ(1u, failures.Count());
+        EXPECT_EQ(&beta, CTestService::FirstService());
+    }
     const ULONG a = alpha.m_ulServiceBit;
     const ULONG b = beta.m_ulServiceBit;
 
@@ -335,6 +342,67 @@ TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
     EXPECT_EQ(2u, failures.Count());
     EXPECT_TRUE(failures.Contains(L"from RegisterServiceCtrlHandlerEx"));
     EXPECT_TRUE(failures.Contains(L"Assertion failure: false"));
+}
+
+namespace
+{
+// The stop-callback thread reports STOPPED while the dispatcher is inside its own report of
+// the same service; the dispatcher's report must not end after STOPPED.
+HANDLE s_hOnStopEntered = nullptr;
+HANDLE s_hStoppedReported = nullptr;
+DWORD s_dwHandlerThread = 0;
+volatile LONG s_cInReport = 0;
+volatile LONG s_fOverlap = 0;
+volatile LONG s_fReportAfterStopped = 0;
+volatile LONG s_fStoppedReported = 0;
+
+BOOL WINAPI RaceReport(SERVICE_STATUS_HANDLE hStatus, LPSERVICE_STATUS pStatus)
+{
+    if (InterlockedIncrement(&s_cInReport) > 1)
+    {
+        InterlockedExchange(&s_fOverlap, 1);
+    }
+    if (s_fStoppedReported)
+    {
+        InterlockedExchange(&s_fReportAfterStopped, 1);
+    }
+    if (GetCurrentThreadId() == s_dwHandlerThread)
+    {
+        // Give the stop thread every chance to report in the middle of this one.
+        WaitForSingleObject(s_hOnStopEntered, c_dwWaitMs);
+        WaitForSingleObject(s_hStoppedReported, 500);
+    }
+    if (pStatus->dwCurrentState == SERVICE_STOPPED)
+    {
+        InterlockedExchange(&s_fStoppedReported, 1);
+        SetEvent(s_hStoppedReported);
+    }
+    InterlockedDecrement(&s_cInReport);
+    return TRUE;
+}
+} // namespace
+
+TEST_F(ServiceShell, ReportsNeverOverlapTheStoppedReport)
+{
+    SVCHOST_GLOBAL_DATA globals = {};
+    CTestService service(L"Racing");
+    s_hOnStopEntered = NewManualEvent();
+    s_hStoppedReported = NewManualEvent();
+    service.m_hStopEntered = s_hOnStopEntered;
+    ASSERT_EQ(0u, RunAsHosted(service, globals));
+
+    s_dwHandlerThread = GetCurrentThreadId();
+    ServiceSetStatusHook(RaceReport);
+    CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
+    ASSERT_TRUE(HostWaitForStopCallbacks(c_dwWaitMs));
+    ServiceSetStatusHook(RecordReport);
+
+    EXPECT_EQ(1, service.m_cStops);
+    EXPECT_EQ(1, s_fStoppedReported);
+    EXPECT_EQ(0, s_fOverlap);
+    EXPECT_EQ(0, s_fReportAfterStopped);
+    CloseHandle(s_hOnStopEntered);
+    CloseHandle(s_hStoppedReported);
 }
 
 namespace
