@@ -83,6 +83,11 @@ TEST_F(ServiceShell, ParseCommandLineTable)
     // Listing a service again (the list's tail, which the assertion cannot tell) changes
     // nothing: the list would become a cycle.
     CService::RegisterService(&alpha);
+    {
+        CTestService gone(L"Gone");
+        CService::RegisterService(&gone);
+    }
+    // A service leaves the list when it is destroyed.
     EXPECT_EQ(&beta, CTestService::FirstService());
     const ULONG a = alpha.m_ulServiceBit;
     const ULONG b = beta.m_ulServiceBit;
