@@ -315,6 +315,37 @@ TEST_F(AsyncPipeTest, CloseDropsQueuedAndLaterWrites)
     CloseAndRelease(listener);
 }
 
+// A client message longer than the receive buffer ends that connection alone.
+TEST_F(AsyncPipeTest, OverlongMessageEndsOnlyItsConnection)
+{
+    std::wstring name = UniquePipeName(L"overlong");
+    Listener first = Listen(name, true);
+    CPipeClient clientFirst;
+    ASSERT_TRUE(ConnectTo(name, first, &clientFirst));
+    Listener second = Listen(name, true);
+    CPipeClient clientSecond;
+    ASSERT_TRUE(ConnectTo(name, second, &clientSecond));
+
+    std::vector<BYTE> overlong = Pattern(AsyncPipe::c_cbMaxMessage + 1, 4);
+    clientFirst.WriteMessage(overlong.data(), static_cast<DWORD>(overlong.size()), c_dwWaitMs);
+    ASSERT_TRUE(first.pSink->WaitForBroken());
+    EXPECT_TRUE(first.pSink->Messages().empty()) << "no part of the message is delivered";
+    EXPECT_TRUE(first.pSink->WaitForRefs(1));
+    BYTE rgb[16];
+    DWORD cbRead = 0;
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_BROKEN_PIPE),
+              clientFirst.ReadMessage(rgb, sizeof(rgb), &cbRead, c_dwWaitMs))
+        << "the service end of that connection is closed";
+
+    BYTE rgbHello[5] = {'h', 'e', 'l', 'l', 'o'};
+    ASSERT_EQ(S_OK, clientSecond.WriteMessage(rgbHello, sizeof(rgbHello), c_dwWaitMs));
+    ASSERT_EQ(S_OK, clientSecond.ReadMessage(rgb, sizeof(rgb), &cbRead, c_dwWaitMs));
+    EXPECT_EQ(5u, cbRead);
+    EXPECT_EQ(0, second.pSink->m_cBroken);
+    CloseAndRelease(first);
+    CloseAndRelease(second);
+}
+
 // The pipe's descriptor comes from the security runtime, lets local clients in and nobody but
 // the system and administrators serve the pipe, and the handle does not leak into processes
 // the service starts.
