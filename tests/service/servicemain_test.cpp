@@ -113,24 +113,19 @@ TEST(ServiceMainUnderScm, StartPendingReportAndDebugSwitch)
 // returns at once with RUNNING while OnStop still works. Someone then deleted the service while
 // it was stopping (sc stop, sc delete): the record stays, marked for deletion, until the service
 // is down. Unregistering it then is no error: the stopping service cannot take another STOP
-// (1061) and is already marked (1072). The service keeps its host a while after STOPPED:
-// registering the name again must wait for the host to leave instead of failing with "marked
-// for delete".
-TEST(TelvaneHost, StopThroughTheHostThenUnregisterAndRegisterAgain)
+// (1061) and is already marked (1072).
+TEST(TelvaneHost, StopThroughTheHostThenUnregisterOfAServiceMarkedForDeletion)
 {
     FailureCapture failures;
     CTestServiceHolder hosted(L"servicetest.dll");
     ASSERT_TRUE(hosted.Created());
-    ASSERT_NE(0u, hosted.StartRunning({L"hold-stop", L"linger"}));
+    ASSERT_NE(0u, hosted.StartRunning({L"hold-stop"}));
     SERVICE_STATUS statusControl = {};
     ASSERT_EQ(0u, ServiceControl(hosted.Name(), SERVICE_CONTROL_STOP, &statusControl));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_RUNNING), statusControl.dwCurrentState);
     ASSERT_TRUE(ServiceDelete(hosted.Name()));
 
     CTestService service(hosted.Name());
-    service.m_idsLocalizedName = 1;
-    service.m_idsDescription = 2;
-    service.m_ulStartType = SERVICE_DEMAND_START;
     CService::RegisterService(&service);
     std::atomic<bool> fDone{false};
     std::thread unregister([&] {
@@ -145,14 +140,33 @@ TEST(TelvaneHost, StopThroughTheHostThenUnregisterAndRegisterAgain)
     EXPECT_EQ(0u, failures.Count());
     EXPECT_FALSE(ServiceExists(hosted.Name()));
     EXPECT_EQ(1, service.m_cUnregisters);
+}
 
+// A stopped service is deleted only once its host has left; registering the name again
+// must wait for that instead of failing with "marked for delete".
+TEST(TelvaneHost, RegistrationWaitsUntilTheOldServiceIsGone)
+{
+    FailureCapture failures;
+    CTestServiceHolder hosted(L"servicetest.dll");
+    ASSERT_TRUE(hosted.Created());
+    ASSERT_NE(0u, hosted.StartRunning({L"linger"}));
+
+    CTestService service(hosted.Name());
+    service.m_idsLocalizedName = 1;
+    service.m_idsDescription = 2;
+    service.m_ulStartType = SERVICE_DEMAND_START;
+    CService::RegisterService(&service);
     service.RegisterOneService();
     EXPECT_EQ(0u, failures.Count());
     SERVICE_RECORD record;
     ASSERT_TRUE(ServiceReadRecord(hosted.Name(), &record));
     EXPECT_EQ(static_cast<DWORD>(SERVICE_DEMAND_START), record.dwStartType);
+    EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_OWN_PROCESS), record.dwServiceType);
+
+    // Unregistering returns only once the name is free.
     service.UnregisterOneService();
     EXPECT_FALSE(ServiceExists(hosted.Name()));
+    EXPECT_EQ(0u, failures.Count());
 }
 
 // A host that loads telvane.dll for a name the DLL does not serve gets a prompt STOPPED with
