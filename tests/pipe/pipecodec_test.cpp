@@ -1,5 +1,6 @@
-// Decoding of every accepted and faulted message form of both pipes, and the joining of parts
-// with its cap. The two messages the service writes are read back by the client tests.
+// Decoding of every accepted and faulted message form of both pipes, and the cap on joined
+// parts (their joining shows in the client tests' delivered items). The two messages the service
+// writes are read back by the client tests.
 #include "servicelib/cpipereassembly.h"
 #include "servicelib/pipecodec.h"
 
@@ -250,36 +251,6 @@ TEST(PipeCodec, DecodesEveryAcceptedAndFaultedForm)
     EXPECT_EQ(TELVANE_MAX_MESSAGE,
               EventPart(1, 1, std::string(TELVANE_MAX_EVENT_PART, 'f')).size());
     EXPECT_EQ(TELVANE_MAX_MESSAGE, ResultPart(1, std::string(TELVANE_MAX_RESULT_PART, 'r')).size());
-}
-
-// Parts are joined in arrival order, and parts that carry nothing (as decoding hands them
-// out) add nothing: a result of empty parts is no content.
-TEST(PipeReassembly, JoinsPartsIntoOneItem)
-{
-    const uint8_t *pb = reinterpret_cast<const uint8_t *>("abcdefoldnew");
-    CPipeReassembly reassembly;
-    EXPECT_EQ(PipePartMore, reassembly.AddPart(pb, 2, false));
-    EXPECT_EQ(PipePartMore, reassembly.AddPart(nullptr, 0, false));
-    EXPECT_EQ(PipePartMore, reassembly.AddPart(pb + 2, 2, false));
-    EXPECT_EQ(PipePartComplete, reassembly.AddPart(pb + 4, 2, true));
-    EXPECT_EQ(6u, reassembly.Size());
-    Bytes item = reassembly.Take();
-    EXPECT_EQ("abcdef", std::string(item.begin(), item.end()));
-    EXPECT_EQ(0u, reassembly.Size());
-
-    for (bool fComplete : {false, false, true})
-    {
-        reassembly.AddPart(nullptr, 0, fComplete);
-    }
-    EXPECT_EQ(0u, reassembly.Size());
-    EXPECT_EQ(nullptr, reassembly.Data());
-
-    // A non-final part left over stays in front of the next item until the owner clears it.
-    reassembly.AddPart(pb + 6, 3, false);
-    EXPECT_EQ(PipePartComplete, reassembly.AddPart(pb + 9, 3, true));
-    EXPECT_EQ("oldnew", std::string(reinterpret_cast<const char *>(reassembly.Data()), 6));
-    reassembly.Clear();
-    EXPECT_EQ(0u, reassembly.Size());
 }
 
 // One item may reach the cap exactly; a part that would pass it empties the buffer and is the

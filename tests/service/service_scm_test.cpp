@@ -1,8 +1,7 @@
-// telvane.dll installed, started and stopped under its real name through the prefix's control
-// manager with the product's own steps: under Wine's own svchost.exe (no host globals) and
-// under telvanehost.exe (the host's stop callback). These tests own the name "Telvane" and the
-// group "OVTCBNetwork" while they run (the suite is serial), and remove the service however
-// they end. Test thread only.
+// telvane.dll installed and removed under its real name through the prefix's control manager
+// with the product's own steps (serving and stopping under both hosts is CoreScm's). These
+// tests own the name "Telvane" and the group "OVTCBNetwork" while they run (the suite is
+// serial), and remove the service however they end. Test thread only.
 #include "servicelib/reghelper.h"
 #include "servicelib/service.h"
 #include "service/resource.h"
@@ -56,30 +55,10 @@ protected:
         RunTelvane(L"-u");
         ServiceStopAndDelete(c_wszTelvane);
     }
-
-    // Starts the service, checks which program hosts it, stops it and sees the host leave.
-    void StartAndStop(const wchar_t *wszHostImage)
-    {
-        SCOPED_TRACE(Narrow(wszHostImage));
-        CServiceProcess host(TelvaneStart());
-        ASSERT_TRUE(host.Opened());
-        SERVICE_STATUS_PROCESS status = {};
-        ASSERT_TRUE(ServiceQueryStatus(c_wszTelvane, &status));
-        EXPECT_EQ(static_cast<DWORD>(SERVICE_WIN32_SHARE_PROCESS), status.dwServiceType);
-        EXPECT_EQ(static_cast<DWORD>(SERVICE_ACCEPT_STOP), status.dwControlsAccepted);
-        EXPECT_NE(std::wstring::npos, host.ImageName().find(wszHostImage))
-            << Narrow(host.ImageName());
-
-        EXPECT_TRUE(TelvaneStop());
-        ASSERT_TRUE(ServiceQueryStatus(c_wszTelvane, &status));
-        EXPECT_EQ(0u, status.dwWin32ExitCode);
-        // The host leaves once its only service has stopped.
-        EXPECT_EQ(0u, host.WaitForExitCode(c_dwWaitMs));
-    }
 };
 } // namespace
 
-TEST_F(TelvaneScm, RegisterRunUnderSvchostAndUnregister)
+TEST_F(TelvaneScm, RegistersReplacesARunningOneAndUnregisters)
 {
     ChildResult result = RunTelvane(L"-r");
     ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
@@ -109,10 +88,6 @@ TEST_F(TelvaneScm, RegisterRunUnderSvchostAndUnregister)
     EXPECT_EQ(1u, dwUnload);
     EXPECT_EQ(1, GroupEntries());
 
-    // Wine's svchost never pushes host globals: the DLL lists its service in ServiceMain and
-    // stops it on the dispatcher thread.
-    StartAndStop(L"svchost.exe");
-
     // Registering again while the service runs leaves one installation, stopped, and one entry.
     ASSERT_NE(0u, TelvaneStart());
     result = RunTelvane(L"-r");
@@ -130,25 +105,4 @@ TEST_F(TelvaneScm, RegisterRunUnderSvchostAndUnregister)
     // Removing what is not installed is not an error.
     EXPECT_EQ(0u, RunTelvane(L"-u").dwExitCode);
     EXPECT_EQ(0u, RunTelvane(L"Telvane /u").dwExitCode);
-}
-
-TEST_F(TelvaneScm, RunsUnderTelvaneHostWithItsStopCallback)
-{
-    ASSERT_EQ(0u, RunTelvane(L"-r").dwExitCode);
-    ASSERT_TRUE(
-        ServiceSetImagePath(c_wszTelvane, BinCommand(L"telvanehost.exe") + L" -k OVTCBNetwork"));
-    // Only the stop callback runs OnStop under this host: without it STOPPED never comes.
-    StartAndStop(L"telvanehost.exe");
-    // And the next start gets a fresh host.
-    StartAndStop(L"telvanehost.exe");
-
-    // Here a STOP returns while the service still runs: registering again must see the old
-    // installation down before it creates the new one.
-    ASSERT_NE(0u, TelvaneStart());
-    ChildResult result = RunTelvane(L"-r");
-    ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    SERVICE_RECORD record;
-    ASSERT_TRUE(ServiceReadRecord(c_wszTelvane, &record));
-    EXPECT_EQ(L"svchost.exe -k OVTCBNetwork", record.wstrBinaryPath);
-    EXPECT_EQ(1, GroupEntries());
 }

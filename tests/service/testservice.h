@@ -75,15 +75,12 @@ public:
     using CService::m_hStopWait;
     using CService::m_idsDescription;
     using CService::m_idsLocalizedName;
-    using CService::m_pNextService;
     using CService::m_status;
     using CService::m_ulServiceBit;
     using CService::m_ulStartType;
 
     static CService *FirstService() { return s_pFirstService; }
-    static bool Svchost() { return s_fSvchost; }
     static const wchar_t *Group() { return s_wszSvchostGroup; }
-    static SVCHOST_GLOBAL_DATA *Globals() { return s_pSvchostGlobals; }
     static HANDLE ConsoleEvent() { return s_hConsoleEvent; }
 
     // Host mode as the DLL's exports leave it, and back to a plain program.
