@@ -320,39 +320,6 @@ TEST_F(HttpsClientTest, NoDeviceCertificateIsNotSent)
     EXPECT_TRUE(server.Requests().empty());
 }
 
-TEST_F(HttpsClientTest, ProvisioningResultDecides)
-{
-    struct Case
-    {
-        const char *szName;
-        DWORD dwResult;
-        HRESULT hrExpected;
-    };
-    const Case rgCases[] = {
-        {"AlreadyProvisionedCountsAsSuccess", 0x81120002, S_OK},
-        {"FailureIsReturned", 0x80070005, static_cast<HRESULT>(0x80070005)},
-        {"OtherFailure", 0x81120003, static_cast<HRESULT>(0x81120003)},
-    };
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(ServerOn(47119, 1))); // the failures never send
-    size_t cRequests = 0;
-    for (const Case &c : rgCases)
-    {
-        SCOPED_TRACE(c.szName);
-        testsupport::HklmSetDword(GOVCPC_STANDIN_KEY, L"Result", c.dwResult);
-        m_session.Clear();
-        EXPECT_EQ(c.hrExpected, Send(Request(CTestPolicyServer::Url(47119))));
-        ULONG ulCode = 0;
-        EXPECT_EQ(FAILED(c.hrExpected), Find(30, &ulCode));
-        if (FAILED(c.hrExpected))
-        {
-            EXPECT_EQ(c.dwResult, ulCode);
-        }
-        cRequests += SUCCEEDED(c.hrExpected) ? 1 : 0;
-        EXPECT_EQ(cRequests, server.Requests().size());
-    }
-}
-
 // Failures before anything is sent, each with its event and code.
 TEST_F(HttpsClientTest, EarlyFailuresReturnTheFailingCallsCode)
 {
@@ -392,7 +359,9 @@ TEST_F(HttpsClientTest, EarlyFailuresReturnTheFailingCallsCode)
     }
 }
 
-TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
+// The connection manager is called in order and its result taken; the provisioning result
+// decides too, where "already provisioned" counts as success.
+TEST_F(HttpsClientTest, ConnectionManagerAndProvisioningDecide)
 {
     struct Case
     {
@@ -400,21 +369,34 @@ TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
         bool fSkip;
         bool fFailInit;
         DWORD dwRequirementsResult;
+        DWORD dwProvisioning;
         HRESULT hrExpected;
-        USHORT usEvent; // 0: none expected
+        USHORT usEvent;    // 0: none expected
+        ULONG ulEventCode; // checked when non-zero
         std::vector<std::string> rgCalls;
     };
     const std::vector<std::string> rgAllCalls = {"CmApiInit",
                                                  "CmSetRequirements 0x00001234 2 1 3 2 0",
                                                  "CmCloseSession 0x00001234", "CmApiDeinit"};
     const Case rgCases[] = {
-        {"RequirementsAccepted", false, false, 0, S_OK, 0, rgAllCalls},
-        {"InitFails", false, true, 0, E_FAIL, 6, {"CmApiInit"}},
-        {"RequirementsRefused", false, false, 5, E_FAIL, 7, rgAllCalls},
-        {"Skipped", true, false, 0, S_OK, 0, {}},
+        {"RequirementsAccepted", false, false, 0, 0, S_OK, 0, 0, rgAllCalls},
+        {"InitFails", false, true, 0, 0, E_FAIL, 6, 0, {"CmApiInit"}},
+        {"RequirementsRefused", false, false, 5, 0, E_FAIL, 7, 5, rgAllCalls},
+        {"Skipped", true, false, 0, 0, S_OK, 0, 0, {}},
+        {"AlreadyProvisioned", true, false, 0, 0x81120002, S_OK, 0, 0, {}},
+        {"ProvisioningFails", true, false, 0, 0x80070005, c_hrAccessDenied, 30, 0x80070005, {}},
+        {"OtherProvisioningFailure",
+         true,
+         false,
+         0,
+         0x81120003,
+         static_cast<HRESULT>(0x81120003),
+         30,
+         0x81120003,
+         {}},
     };
     CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(ServerOn(47123, 2)));
+    ASSERT_TRUE(server.Start(ServerOn(47123, 3)));
     size_t cRequests = 0;
     for (const Case &c : rgCases)
     {
@@ -431,6 +413,10 @@ TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
             testsupport::HklmSetDword(CM_STANDIN_KEY, L"RequirementsResult",
                                       c.dwRequirementsResult);
         }
+        if (c.dwProvisioning != 0)
+        {
+            testsupport::HklmSetDword(GOVCPC_STANDIN_KEY, L"Result", c.dwProvisioning);
+        }
         m_session.Clear();
 
         JsonRequest request = Request(CTestPolicyServer::Url(47123));
@@ -441,8 +427,9 @@ TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
         if (c.usEvent != 0)
         {
             ASSERT_TRUE(Find(c.usEvent, &ulCode));
-            EXPECT_EQ(c.dwRequirementsResult, c.dwRequirementsResult != 0 ? ulCode : 0);
+            EXPECT_EQ(c.ulEventCode, c.ulEventCode != 0 ? ulCode : 0);
         }
+        EXPECT_EQ(c.usEvent == 30, Find(30));
         cRequests += SUCCEEDED(c.hrExpected) ? 1 : 0;
         EXPECT_EQ(cRequests, server.Requests().size());
     }
