@@ -471,6 +471,34 @@ TEST_F(HttpsClientTest, WritesOnlyWhatTheSessionEnabled)
     }
 }
 
+// A real session filters on level and keyword together: each class's events carry both.
+TEST(OrvexJsonTrace, EventsCarryTheLevelOfTheirKeyword)
+{
+    const EVENT_DESCRIPTOR *rgpClasses[c_cOrvexJsonTraceBits] = {
+        &OrvexJsonEvent_HttpStatus, &OrvexJsonEvent_Sending, &OrvexJsonEvent_Body};
+    for (ULONG i = 0; i < c_cOrvexJsonTraceBits; i++)
+    {
+        EXPECT_EQ(c_rgullOrvexJsonTraceKeywords[i], rgpClasses[i]->Keyword) << i;
+        EXPECT_EQ(c_rgucOrvexJsonTraceLevels[i], rgpClasses[i]->Level) << i;
+    }
+}
+
+// Where no trace session can listen (Wine), TELVANE_TRACE_STDOUT turns every event of the
+// client's provider on when it registers and echoes each one as a debug line.
+TEST_F(HttpsClientTest, TraceStdoutEchoesTheClientsEvents)
+{
+    m_session.Enable(false);
+    ASSERT_TRUE(SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", L"1"));
+    testsupport::LogCapture log;
+
+    HRESULT hr = Send(Request(L"ftp://localhost:47137/v1/api/config/udpecho"));
+    SetEnvironmentVariableW(L"TELVANE_TRACE_STDOUT", nullptr);
+
+    EXPECT_EQ(HRESULT_FROM_WIN32(ERROR_WINHTTP_UNRECOGNIZED_SCHEME), hr);
+    EXPECT_EQ(std::vector<USHORT>({1}), Ids());
+    EXPECT_TRUE(log.Contains(L"EventTrace: 1 0x80072ee6"));
+}
+
 // Wine never reports a secure failure, so this case hands the status callback the
 // notification itself, while the real request waits on a listener that never answers its
 // handshake. The completion runs once, with E_ACCESSDENIED; the real failure that follows
