@@ -435,6 +435,19 @@ TEST_F(HttpsClientTest, ConnectionManagerAndProvisioningDecide)
     }
 }
 
+TEST_F(HttpsClientTest, NullArgumentsAreRefused)
+{
+    JsonRequest request = Request(CTestPolicyServer::Url(47129));
+    JsonValue *pRoot = reinterpret_cast<JsonValue *>(1);
+    EXPECT_EQ(E_INVALIDARG, OrvexJsonSendRequest(&request, nullptr));
+    EXPECT_EQ(E_INVALIDARG, OrvexJsonSendRequest(nullptr, &pRoot));
+    EXPECT_EQ(reinterpret_cast<JsonValue *>(1), pRoot); // untouched on failure
+    JsonRequestContext *pContext = nullptr;
+    EXPECT_EQ(E_INVALIDARG, OrvexJsonSend(&request, nullptr, nullptr, &pContext));
+    EXPECT_EQ(E_INVALIDARG, OrvexJsonClose(nullptr));
+    EXPECT_TRUE(Ids().empty());
+}
+
 // A trace session's keywords decide which events are written, by their class: error (19),
 // information (12, 24) and verbose (27, 15, 99, 26). A 404 and then an object. How a level
 // turns a class off is the common provider's (EventTraceTest) and each class's level is
