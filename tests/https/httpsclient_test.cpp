@@ -168,6 +168,8 @@ TEST_F(HttpsClientTest, CompletesWithTheAnswersOutcome)
         {"NotFound404", 47102, 404, "{\"Enabled\":\"true\"}", 0, 0, c_hrStatus, 19, 404, nullptr},
         {"EmptyBody", 47103, 200, "", 0, 0, c_hrEmpty, 23, 0, nullptr},
         {"ArrayRoot", 47104, 200, "[1,2]", 0, 0, c_hrNotObject, 25, 0, nullptr},
+        {"ScalarRoot", 47107, 200, "\"text\"", 0, 0, c_hrNotObject, 25, 0, nullptr},
+        {"ServerError500", 47112, 500, "{}", 0, 0, c_hrStatus, 19, 500, nullptr},
         // Pieces that each carry distinct text: a lost, doubled or reordered piece changes the
         // body that event 99 carries.
         {"Chunked", 47108, 200,
