@@ -248,6 +248,9 @@ TEST(TelvanectlPlatform, StatePublishesToSubscribersAndShows)
     const std::wstring wstrState = L"platform state " + platformtest::StateNameText(stateName);
     const std::string strLabel =
         "state " + testsupport::Narrow(platformtest::StateNameText(stateName));
+    // A subscriber creates the state's key to watch it; the state still reads unpublished.
+    CDeliveryLog log;
+    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log, &c_typeId);
     EXPECT_EQ(strLabel + ": not published\r\n", testsupport::RunTelvanectl(wstrState).strOutput);
 
     struct Case
@@ -257,8 +260,6 @@ TEST(TelvanectlPlatform, StatePublishesToSubscribersAndShows)
     };
     const Case rgCases[] = {
         {L"5", 5}, {L"0", 0}, {L"4294967295", 0xFFFFFFFF}, {L"0x1F", 31}, {L"0XaB", 171}};
-    CDeliveryLog log;
-    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log, &c_typeId);
     WNF_CHANGE_STAMP stamp = 0;
     for (const Case &c : rgCases)
     {
