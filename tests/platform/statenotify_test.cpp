@@ -133,6 +133,34 @@ void ExpectNoMoreDeliveries(WNF_STATE_NAME stateName, const CDeliveryLog &ended)
 }
 } // namespace
 
+TEST(StateNotify, RefusesMissingArguments)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    DWORD dwValue = 0;
+    ULONG cb = sizeof(dwValue);
+    WNF_CHANGE_STAMP stamp = 0;
+    const NTSTATUS c_status = static_cast<NTSTATUS>(STATUS_INVALID_PARAMETER);
+    EXPECT_EQ(c_status, NtQueryWnfStateData(nullptr, nullptr, nullptr, &stamp, &dwValue, &cb));
+    EXPECT_EQ(c_status,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, &dwValue, nullptr));
+    // A size without a buffer.
+    EXPECT_EQ(c_status, NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, nullptr, &cb));
+
+    CDeliveryLog log;
+    PWNF_USER_SUBSCRIPTION pSubscription = nullptr;
+    PWNF_USER_CALLBACK pfn = CDeliveryLog::Callback;
+    EXPECT_EQ(c_status, RtlSubscribeWnfStateChangeNotification(nullptr, stateName, 0, pfn, &log,
+                                                               nullptr, 0, 0));
+    EXPECT_EQ(c_status, RtlSubscribeWnfStateChangeNotification(&pSubscription, stateName, 0,
+                                                               nullptr, &log, nullptr, 0, 0));
+    EXPECT_EQ(nullptr, pSubscription);
+    pSubscription = reinterpret_cast<PWNF_USER_SUBSCRIPTION>(1);
+    EXPECT_EQ(c_status, RtlSubscribeWnfStateChangeNotification(&pSubscription, stateName, 0, pfn,
+                                                               &log, nullptr, 0, 1)); // flags
+    EXPECT_EQ(nullptr, pSubscription);
+    EXPECT_EQ(c_status, RtlUnsubscribeWnfNotificationWaitForCompletion(nullptr));
+}
+
 TEST(StateNotify, QueryReturnsTheLatestPublicationWithItsStamp)
 {
     WNF_STATE_NAME stateName = NewStateName();
