@@ -55,11 +55,6 @@ CCollectorThread::CCollectorThread(const std::wstring &wstrPipe, const GUID &col
     , m_collectorId(collectorId)
     , m_strResult(std::move(strResult))
     , m_cRequests(cRequests)
-    , m_fRegistered(false)
-    , m_fEnded(false)
-    , m_fStop(false)
-    , m_fHold(false)
-    , m_fVanish(false)
     , m_thread([this] { Run(); })
 {
 }
@@ -76,7 +71,7 @@ void CCollectorThread::Run()
     {
         m_fRegistered = true;
         size_t cAnswered = 0;
-        while (!m_fStop && !m_fVanish && (m_cRequests == 0 || cAnswered < m_cRequests))
+        while (!m_fStop && (m_cRequests == 0 || cAnswered < m_cRequests))
         {
             GUID activityId;
             GUID logId;
@@ -93,11 +88,11 @@ void CCollectorThread::Run()
                 std::lock_guard<std::mutex> guard(m_lock);
                 m_rgLogIds.push_back(logId);
             }
-            while (m_fHold && !m_fStop && !m_fVanish)
+            while (m_fHold && !m_fStop)
             {
                 Sleep(5);
             }
-            if (m_fVanish || m_fStop)
+            if (m_fStop)
             {
                 break;
             }
@@ -107,7 +102,7 @@ void CCollectorThread::Run()
             }
             cAnswered++;
         }
-        if (!m_fVanish && !m_fStop && m_cRequests != 0)
+        if (!m_fStop && m_cRequests != 0)
         {
             client.BreakPipe();
         }
@@ -132,34 +127,10 @@ bool CCollectorThread::WaitRequests(size_t c, DWORD dwTimeoutMs)
         dwTimeoutMs);
 }
 
-bool CCollectorThread::WaitEnded(DWORD dwTimeoutMs)
-{
-    return WaitUntil([&] { return m_fEnded.load(); }, dwTimeoutMs);
-}
-
 std::vector<GUID> CCollectorThread::RequestLogIds() const
 {
     std::lock_guard<std::mutex> guard(m_lock);
     return m_rgLogIds;
-}
-
-void CCollectorThread::Hold()
-{
-    m_fHold = true;
-}
-
-void CCollectorThread::Release()
-{
-    m_fHold = false;
-}
-
-void CCollectorThread::Vanish()
-{
-    m_fVanish = true;
-    if (m_thread.joinable())
-    {
-        m_thread.join();
-    }
 }
 
 void CCollectorThread::Stop()

@@ -53,14 +53,17 @@ public:
 
     bool WaitRegistered(DWORD dwTimeoutMs = c_dwWaitMs);
     bool WaitRequests(size_t c, DWORD dwTimeoutMs = c_dwWaitMs);
-    bool WaitEnded(DWORD dwTimeoutMs = c_dwWaitMs);
+    bool WaitEnded(DWORD dwTimeoutMs = c_dwWaitMs)
+    {
+        return WaitUntil([&] { return m_fEnded.load(); }, dwTimeoutMs);
+    }
     // The LogIDs of the requests in the order they came.
     std::vector<GUID> RequestLogIds() const;
     // Holds the next answers until Release (the collector stays busy meanwhile).
-    void Hold();
-    void Release();
-    // Drops the connection without a goodbye.
-    void Vanish();
+    void Hold() { m_fHold = true; }
+    void Release() { m_fHold = false; }
+    // Drops the connection without a goodbye (a request it holds stays unanswered).
+    void Vanish() { Stop(); }
     void Stop();
 
 private:
@@ -72,11 +75,10 @@ private:
     size_t m_cRequests;
     mutable std::mutex m_lock;
     std::vector<GUID> m_rgLogIds;
-    std::atomic<bool> m_fRegistered;
-    std::atomic<bool> m_fEnded;
-    std::atomic<bool> m_fStop;
-    std::atomic<bool> m_fHold;
-    std::atomic<bool> m_fVanish;
+    std::atomic<bool> m_fRegistered{false};
+    std::atomic<bool> m_fEnded{false};
+    std::atomic<bool> m_fStop{false};
+    std::atomic<bool> m_fHold{false};
     std::thread m_thread;
 };
 } // namespace testsupport

@@ -1,4 +1,5 @@
 #include "tests/common/policyserver.h"
+#include "tests/common/testsupport.h"
 
 #include <stdio.h>
 #include <fstream>
@@ -8,7 +9,6 @@ namespace
 {
 // How long a server may take to start listening (Python's start under load).
 const DWORD c_dwStartLimitMs = 60000;
-const DWORD c_dwPollMs = 20;
 
 std::string RunDir()
 {
@@ -33,16 +33,14 @@ std::wstring CTestPolicyServer::WindowsPath(const std::string &strLinuxPath)
 
 std::wstring CTestPolicyServer::Url(USHORT usPort, const char *szScheme)
 {
-    std::string strUrl =
-        std::string(szScheme) + "://localhost:" + std::to_string(usPort) + "/v1/api/config/udpecho";
-    return std::wstring(strUrl.begin(), strUrl.end());
+    return testsupport::Widen(std::string(szScheme) + "://localhost:" + std::to_string(usPort) +
+                              "/v1/api/config/udpecho");
 }
 
 bool CTestPolicyServer::Start(const PolicyServerOptions &options)
 {
     std::string strRun = RunDir();
-    CreateDirectoryW(WindowsPath(TELVANE_HTTPS_DIR).c_str(), nullptr);
-    CreateDirectoryW(WindowsPath(strRun).c_str(), nullptr);
+    testsupport::CreateFolders(WindowsPath(strRun));
     std::string strBase = strRun + "/" + std::to_string(options.usPort);
     std::string strReady = strBase + ".ready";
     m_strLog = strBase + ".log";
@@ -64,15 +62,12 @@ bool CTestPolicyServer::Start(const PolicyServerOptions &options)
     {
         // Through a file: a body may hold quotes and spaces that a command line would mangle.
         std::string strBodyFile = strBase + ".body";
-        std::ofstream body(WindowsPath(strBodyFile).c_str(), std::ios::binary | std::ios::trunc);
-        body << options.strBody;
-        body.close();
+        testsupport::WriteFileText(WindowsPath(strBodyFile), options.strBody);
         cmd << " --body-file " << strBodyFile;
     }
 
-    std::wstring wstrCommand = WindowsPath(TELVANE_PYTHON3);
-    std::string strArgs = cmd.str().substr(sizeof(TELVANE_PYTHON3) - 1);
-    wstrCommand += std::wstring(strArgs.begin(), strArgs.end());
+    std::wstring wstrCommand = WindowsPath(TELVANE_PYTHON3) +
+                               testsupport::Widen(cmd.str().substr(sizeof(TELVANE_PYTHON3) - 1));
     STARTUPINFOW si = {};
     si.cb = sizeof(si);
     PROCESS_INFORMATION pi = {};
@@ -86,15 +81,9 @@ bool CTestPolicyServer::Start(const PolicyServerOptions &options)
     CloseHandle(pi.hThread);
     CloseHandle(pi.hProcess);
     std::wstring wstrReady = WindowsPath(strReady);
-    for (DWORD dwWaited = 0; dwWaited < c_dwStartLimitMs; dwWaited += c_dwPollMs)
-    {
-        if (GetFileAttributesW(wstrReady.c_str()) != INVALID_FILE_ATTRIBUTES)
-        {
-            return true;
-        }
-        Sleep(c_dwPollMs);
-    }
-    return false;
+    return testsupport::WaitUntil(
+        [&] { return GetFileAttributesW(wstrReady.c_str()) != INVALID_FILE_ATTRIBUTES; },
+        c_dwStartLimitMs);
 }
 
 std::vector<std::string> CTestPolicyServer::Requests() const

@@ -188,35 +188,25 @@ void ServiceStopAndDelete(const wchar_t *wszService)
 }
 
 CServiceProcess::CServiceProcess(DWORD dwProcessId)
-    : m_hProcess(OpenProcess(SYNCHRONIZE | PROCESS_QUERY_LIMITED_INFORMATION, FALSE, dwProcessId))
+    : m_process(OpenProcess(SYNCHRONIZE | PROCESS_QUERY_LIMITED_INFORMATION, FALSE, dwProcessId))
 {
-}
-
-CServiceProcess::~CServiceProcess()
-{
-    if (m_hProcess != nullptr)
-    {
-        CloseHandle(m_hProcess);
-    }
 }
 
 std::wstring CServiceProcess::ImageName() const
 {
     wchar_t wszImage[MAX_PATH] = L"";
     DWORD cchImage = MAX_PATH;
-    if (m_hProcess == nullptr || !QueryFullProcessImageNameW(m_hProcess, 0, wszImage, &cchImage))
-    {
-        return std::wstring();
-    }
-    return wszImage;
+    return Opened() && QueryFullProcessImageNameW(m_process.Get(), 0, wszImage, &cchImage)
+               ? wszImage
+               : std::wstring();
 }
 
 DWORD CServiceProcess::WaitForExitCode(DWORD dwTimeoutMs) const
 {
     DWORD dwExitCode = STILL_ACTIVE;
-    if (m_hProcess != nullptr && WaitForSingleObject(m_hProcess, dwTimeoutMs) == WAIT_OBJECT_0)
+    if (Opened() && WaitForSingleObject(m_process.Get(), dwTimeoutMs) == WAIT_OBJECT_0)
     {
-        GetExitCodeProcess(m_hProcess, &dwExitCode);
+        GetExitCodeProcess(m_process.Get(), &dwExitCode);
     }
     return dwExitCode;
 }

@@ -3,6 +3,7 @@
 // the platform component registered) under either host. Used on the test thread.
 #pragma once
 
+#include "inc/handleholder.h"
 #include "tests/common/testsupport.h"
 
 #include <windows.h>
@@ -67,17 +68,14 @@ class CServiceProcess
 {
 public:
     explicit CServiceProcess(DWORD dwProcessId);
-    ~CServiceProcess();
-    CServiceProcess(const CServiceProcess &) = delete;
-    CServiceProcess &operator=(const CServiceProcess &) = delete;
 
-    bool Opened() const { return m_hProcess != nullptr; }
+    bool Opened() const { return m_process.IsValid(); }
     std::wstring ImageName() const;
     // Waits (bounded) for the process to end: its exit code, or STILL_ACTIVE when it did not.
     DWORD WaitForExitCode(DWORD dwTimeoutMs) const;
 
 private:
-    HANDLE m_hProcess;
+    CKernelHandle m_process;
 };
 
 // The product under its real name, installed and removed with the README's own steps.

@@ -8,9 +8,7 @@ namespace testsupport
 {
 void PreparePolicyFolder()
 {
-    CreateDirectoryW(L"C:\\data", nullptr);
-    CreateDirectoryW(L"C:\\data\\shareddata", nullptr);
-    CreateDirectoryW(L"C:\\data\\shareddata\\zoriviroruz", nullptr);
+    CreateFolders(L"C:\\data\\shareddata\\zoriviroruz");
     DeleteFileW(c_wszUdpConfigFile);
     RemoveDirectoryW(c_wszUdpConfigTempFile); // a test may have left a folder in its place
     DeleteFileW(c_wszUdpConfigTempFile);
@@ -22,11 +20,8 @@ const wchar_t c_wszResultFolder[] = L"C:\\data\\shareddata\\zoriviroruz\\results
 
 void InstallTestApplication()
 {
-    CreateDirectoryW(L"C:\\programs", nullptr);
-    CreateDirectoryW(L"C:\\programs\\zoriviroruz", nullptr);
-    CreateDirectoryW(L"C:\\data", nullptr);
-    CreateDirectoryW(L"C:\\data\\shareddata", nullptr);
-    CreateDirectoryW(L"C:\\data\\shareddata\\zoriviroruz", nullptr);
+    CreateFolders(L"C:\\programs\\zoriviroruz");
+    CreateFolders(L"C:\\data\\shareddata\\zoriviroruz");
     std::wstring wstrBuilt = BinDir() + L"ZoRiVirOruz.exe";
     ASSERT_TRUE(CopyFileW(wstrBuilt.c_str(), c_wszTestAppPath, FALSE)) << GetLastError();
     for (const std::wstring &wstrFile : ResultFiles())
@@ -37,19 +32,11 @@ void InstallTestApplication()
 
 std::vector<std::wstring> ResultFiles()
 {
-    std::vector<std::wstring> rgFiles;
-    WIN32_FIND_DATAW data;
-    std::wstring wstrPattern = std::wstring(c_wszResultFolder) + L"\\*.json";
-    HANDLE hFind = FindFirstFileW(wstrPattern.c_str(), &data);
-    if (hFind == INVALID_HANDLE_VALUE)
+    std::vector<std::wstring> rgFiles = FileNames(c_wszResultFolder, L"*.json");
+    for (std::wstring &wstrFile : rgFiles)
     {
-        return rgFiles;
+        wstrFile = std::wstring(c_wszResultFolder) + L"\\" + wstrFile;
     }
-    do
-    {
-        rgFiles.push_back(std::wstring(c_wszResultFolder) + L"\\" + data.cFileName);
-    } while (FindNextFileW(hFind, &data));
-    FindClose(hFind);
     return rgFiles;
 }
 
@@ -81,19 +68,18 @@ CRelayProcess::CRelayProcess(unsigned short usPort, const std::wstring &wstrExtr
         return;
     }
     CloseHandle(pi.hThread);
-    m_hProcess = pi.hProcess;
-    HANDLE rgh[] = {hReady, m_hProcess};
+    m_process.Reset(pi.hProcess);
+    HANDLE rgh[] = {hReady, m_process.Get()};
     m_fListening = WaitForMultipleObjects(2, rgh, FALSE, 30000) == WAIT_OBJECT_0;
     CloseHandle(hReady);
 }
 
 CRelayProcess::~CRelayProcess()
 {
-    if (m_hProcess != nullptr)
+    // The relay ends by itself once idle; a test that failed early still waits for it.
+    if (m_process.IsValid())
     {
-        // The relay ends by itself once idle; a test that failed early still waits for it.
-        WaitForSingleObject(m_hProcess, 30000);
-        CloseHandle(m_hProcess);
+        WaitForSingleObject(m_process.Get(), 30000);
     }
     DeleteFileW(m_wstrReport.c_str());
 }
@@ -101,7 +87,7 @@ CRelayProcess::~CRelayProcess()
 std::string CRelayProcess::WaitForReport()
 {
     std::string strReport;
-    if (m_hProcess == nullptr || WaitForSingleObject(m_hProcess, 60000) != WAIT_OBJECT_0)
+    if (!m_process.IsValid() || WaitForSingleObject(m_process.Get(), 60000) != WAIT_OBJECT_0)
     {
         return strReport;
     }

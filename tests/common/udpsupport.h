@@ -2,6 +2,8 @@
 // as the README's steps install it, and a loopback echo relay process. Used on the test thread.
 #pragma once
 
+#include "inc/handleholder.h"
+
 #include <windows.h>
 #include <string>
 #include <vector>
@@ -33,7 +35,7 @@ public:
     std::string WaitForReport();
 
 private:
-    HANDLE m_hProcess = nullptr;
+    CKernelHandle m_process;
     bool m_fListening = false;
     std::wstring m_wstrReport;
 };

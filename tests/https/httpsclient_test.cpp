@@ -169,6 +169,7 @@ TEST_F(HttpsClientTest, CompletesWithTheAnswersOutcome)
         {"EmptyBody", 47103, 200, "", 0, 0, c_hrEmpty, 23, 0, nullptr},
         {"ArrayRoot", 47104, 200, "[1,2]", 0, 0, c_hrNotObject, 25, 0, nullptr},
         {"ScalarRoot", 47107, 200, "\"text\"", 0, 0, c_hrNotObject, 25, 0, nullptr},
+        {"ServerError500", 47112, 500, "{}", 0, 0, c_hrStatus, 19, 500, nullptr},
         // Pieces that each carry distinct text: a lost, doubled or reordered piece changes the
         // body that event 99 carries.
         {"Chunked", 47108, 200,
@@ -180,7 +181,6 @@ TEST_F(HttpsClientTest, CompletesWithTheAnswersOutcome)
          nullptr},
         {"ChunkedPastLimit", 47111, 200, nullptr, 8, 3 * c_cbOrvexJsonMaxBody, c_hrTooLarge, 28, 0,
          nullptr},
-        {"ServerError500", 47112, 500, "{}", 0, 0, c_hrStatus, 19, 500, nullptr},
     };
     for (const Case &c : rgCases)
     {
@@ -195,8 +195,23 @@ TEST_F(HttpsClientTest, CompletesWithTheAnswersOutcome)
         ASSERT_TRUE(server.Start(options));
         m_session.Clear();
 
+        // An http URL still goes over TLS; the service sees the device certificate (the other
+        // imported client certificate has no device usage and must not be chosen), the path,
+        // and the caller's extra headers after the content type.
+        JsonRequest request = Request(CTestPolicyServer::Url(c.usPort, "http"));
+        request.extraHeaders = L"X-Telvane-Test: seen";
         std::unique_ptr<JsonValue> pRoot;
-        EXPECT_EQ(c.hrExpected, Send(Request(CTestPolicyServer::Url(c.usPort)), &pRoot));
+        EXPECT_EQ(c.hrExpected, Send(request, &pRoot));
+        std::vector<std::string> rgSeen = server.Requests();
+        EXPECT_EQ(1u, rgSeen.size());
+        for (const char *szPart : {"\"client\": \"Telvane Test Device\"",
+                                   "\"path\": \"/v1/api/config/udpecho\"", "\"method\": \"GET\"",
+                                   "\"contentType\": \"application/json\"", "\"extra\": \"seen\""})
+        {
+            EXPECT_NE(std::string::npos,
+                      rgSeen.empty() ? std::string::npos : rgSeen[0].find(szPart))
+                << szPart;
+        }
         ULONG ulCode = 0;
         EXPECT_TRUE(Find(c.usEvent, &ulCode));
         if (c.ulEventCode != 0)
@@ -217,29 +232,6 @@ TEST_F(HttpsClientTest, CompletesWithTheAnswersOutcome)
         EXPECT_EQ(c.szEnabled == nullptr, Find(27)); // the failure path ran, or not
         EXPECT_TRUE(Find(12));                       // sent
         EXPECT_TRUE(Find(15));                       // closed
-    }
-}
-
-// An http URL still goes over TLS; the service sees the device certificate (the other
-// imported client certificate has no device usage and must not be chosen), the path, and
-// the caller's extra headers after the content type.
-TEST_F(HttpsClientTest, ServiceSeesTheDeviceCertificatePathAndHeaders)
-{
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(ServerOn(47114)));
-
-    JsonRequest request = Request(CTestPolicyServer::Url(47114, "http"));
-    request.extraHeaders = L"X-Telvane-Test: seen";
-    std::unique_ptr<JsonValue> pRoot;
-    ASSERT_EQ(S_OK, Send(request, &pRoot));
-    EXPECT_EQ("true", MemberText(pRoot.get(), "Enabled"));
-    std::vector<std::string> rgRequests = server.Requests();
-    ASSERT_EQ(1u, rgRequests.size());
-    for (const char *szPart :
-         {"\"client\": \"Telvane Test Device\"", "\"path\": \"/v1/api/config/udpecho\"",
-          "\"method\": \"GET\"", "\"contentType\": \"application/json\"", "\"extra\": \"seen\""})
-    {
-        EXPECT_NE(std::string::npos, rgRequests[0].find(szPart)) << szPart << rgRequests[0];
     }
 }
 
@@ -322,39 +314,6 @@ TEST_F(HttpsClientTest, NoDeviceCertificateIsNotSent)
     EXPECT_TRUE(server.Requests().empty());
 }
 
-TEST_F(HttpsClientTest, ProvisioningResultDecides)
-{
-    struct Case
-    {
-        const char *szName;
-        DWORD dwResult;
-        HRESULT hrExpected;
-    };
-    const Case rgCases[] = {
-        {"AlreadyProvisionedCountsAsSuccess", 0x81120002, S_OK},
-        {"FailureIsReturned", 0x80070005, static_cast<HRESULT>(0x80070005)},
-        {"OtherFailure", 0x81120003, static_cast<HRESULT>(0x81120003)},
-    };
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(ServerOn(47119, 1))); // the failures never send
-    size_t cRequests = 0;
-    for (const Case &c : rgCases)
-    {
-        SCOPED_TRACE(c.szName);
-        testsupport::HklmSetDword(GOVCPC_STANDIN_KEY, L"Result", c.dwResult);
-        m_session.Clear();
-        EXPECT_EQ(c.hrExpected, Send(Request(CTestPolicyServer::Url(47119))));
-        ULONG ulCode = 0;
-        EXPECT_EQ(FAILED(c.hrExpected), Find(30, &ulCode));
-        if (FAILED(c.hrExpected))
-        {
-            EXPECT_EQ(c.dwResult, ulCode);
-        }
-        cRequests += SUCCEEDED(c.hrExpected) ? 1 : 0;
-        EXPECT_EQ(cRequests, server.Requests().size());
-    }
-}
-
 // Failures before anything is sent, each with its event and code.
 TEST_F(HttpsClientTest, EarlyFailuresReturnTheFailingCallsCode)
 {
@@ -394,7 +353,9 @@ TEST_F(HttpsClientTest, EarlyFailuresReturnTheFailingCallsCode)
     }
 }
 
-TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
+// The connection manager is called in order and its result taken; the provisioning result
+// decides too, where "already provisioned" counts as success.
+TEST_F(HttpsClientTest, ConnectionManagerAndProvisioningDecide)
 {
     struct Case
     {
@@ -402,21 +363,34 @@ TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
         bool fSkip;
         bool fFailInit;
         DWORD dwRequirementsResult;
+        DWORD dwProvisioning;
         HRESULT hrExpected;
-        USHORT usEvent; // 0: none expected
+        USHORT usEvent;    // 0: none expected
+        ULONG ulEventCode; // checked when non-zero
         std::vector<std::string> rgCalls;
     };
     const std::vector<std::string> rgAllCalls = {"CmApiInit",
                                                  "CmSetRequirements 0x00001234 2 1 3 2 0",
                                                  "CmCloseSession 0x00001234", "CmApiDeinit"};
     const Case rgCases[] = {
-        {"RequirementsAccepted", false, false, 0, S_OK, 0, rgAllCalls},
-        {"InitFails", false, true, 0, E_FAIL, 6, {"CmApiInit"}},
-        {"RequirementsRefused", false, false, 5, E_FAIL, 7, rgAllCalls},
-        {"Skipped", true, false, 0, S_OK, 0, {}},
+        {"RequirementsAccepted", false, false, 0, 0, S_OK, 0, 0, rgAllCalls},
+        {"InitFails", false, true, 0, 0, E_FAIL, 6, 0, {"CmApiInit"}},
+        {"RequirementsRefused", false, false, 5, 0, E_FAIL, 7, 5, rgAllCalls},
+        {"Skipped", true, false, 0, 0, S_OK, 0, 0, {}},
+        {"AlreadyProvisioned", true, false, 0, 0x81120002, S_OK, 0, 0, {}},
+        {"ProvisioningFails", true, false, 0, 0x80070005, c_hrAccessDenied, 30, 0x80070005, {}},
+        {"OtherProvisioningFailure",
+         true,
+         false,
+         0,
+         0x81120003,
+         static_cast<HRESULT>(0x81120003),
+         30,
+         0x81120003,
+         {}},
     };
     CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(ServerOn(47123, 2)));
+    ASSERT_TRUE(server.Start(ServerOn(47123, 3)));
     size_t cRequests = 0;
     for (const Case &c : rgCases)
     {
@@ -433,6 +407,10 @@ TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
             testsupport::HklmSetDword(CM_STANDIN_KEY, L"RequirementsResult",
                                       c.dwRequirementsResult);
         }
+        if (c.dwProvisioning != 0)
+        {
+            testsupport::HklmSetDword(GOVCPC_STANDIN_KEY, L"Result", c.dwProvisioning);
+        }
         m_session.Clear();
 
         JsonRequest request = Request(CTestPolicyServer::Url(47123));
@@ -443,8 +421,9 @@ TEST_F(HttpsClientTest, ConnectionManagerIsCalledInOrderAndItsResultTaken)
         if (c.usEvent != 0)
         {
             ASSERT_TRUE(Find(c.usEvent, &ulCode));
-            EXPECT_EQ(c.dwRequirementsResult, c.dwRequirementsResult != 0 ? ulCode : 0);
+            EXPECT_EQ(c.ulEventCode, c.ulEventCode != 0 ? ulCode : 0);
         }
+        EXPECT_EQ(c.usEvent == 30, Find(30));
         cRequests += SUCCEEDED(c.hrExpected) ? 1 : 0;
         EXPECT_EQ(cRequests, server.Requests().size());
     }

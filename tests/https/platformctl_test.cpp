@@ -14,22 +14,11 @@ DWORD Ctl(const wchar_t *wszArgs)
 {
     return testsupport::RunTelvanectl(std::wstring(L"platform ") + wszArgs).dwExitCode;
 }
+} // namespace
 
-// Puts the stand-ins' steering values back after each test; runs on the main thread.
-class PlatformCtlTest : public ::testing::Test
-{
-protected:
-    void TearDown() override
-    {
-        for (const wchar_t *wszValue : {L"FailInit", L"RequirementsResult", L"Calls"})
-        {
-            testsupport::HklmDeleteValue(CM_STANDIN_KEY, wszValue);
-        }
-        testsupport::HklmDeleteValue(GOVCPC_STANDIN_KEY, L"Result");
-    }
-};
-
-TEST_F(PlatformCtlTest, ConnectionManagerIsSteeredAndItsCallsShown)
+// The steering values end where they started: "cm ok", "cm clear" and "cert provision ok"
+// remove them.
+TEST(PlatformCtlTest, ConnectionManagerAndProvisioningAreSteered)
 {
     ASSERT_EQ(0u, Ctl(L"cm clear"));
     ASSERT_EQ(0u, Ctl(L"cm fail init"));
@@ -52,17 +41,14 @@ TEST_F(PlatformCtlTest, ConnectionManagerIsSteeredAndItsCallsShown)
     EXPECT_EQ(0u, CmSetRequirements(0x42, rgdw, sizeof(rgdw)));
     ASSERT_EQ(0u, Ctl(L"cm clear"));
     EXPECT_EQ(std::string(), testsupport::RunTelvanectl(L"platform cm calls").strOutput);
-}
 
-TEST_F(PlatformCtlTest, ProvisioningAnswerIsSet)
-{
     ASSERT_EQ(0u, Ctl(L"cert provision fail 0x81120005"));
     EXPECT_EQ(static_cast<HRESULT>(0x81120005), GOVCPC_ProvisionGOVCertificate());
     ASSERT_EQ(0u, Ctl(L"cert provision ok"));
     EXPECT_EQ(S_OK, GOVCPC_ProvisionGOVCertificate());
 }
 
-TEST_F(PlatformCtlTest, BadArgumentsExitWithUsage)
+TEST(PlatformCtlTest, BadArgumentsExitWithUsage)
 {
     for (const wchar_t *wszArgs :
          {L"cm bogus", L"cm fail requirements 0", L"cm fail requirements x", L"cm fail",
@@ -76,4 +62,3 @@ TEST_F(PlatformCtlTest, BadArgumentsExitWithUsage)
             << testsupport::Narrow(wszArgs);
     }
 }
-} // namespace

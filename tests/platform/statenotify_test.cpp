@@ -1,6 +1,6 @@
-// The state-notification stand-in: machine-wide values published by one process and seen by
-// another, the subscription lifecycle (including its end from inside its own callback), and
-// the query's corner cases.
+// The state-notification stand-in: machine-wide values published by one process (telvanectl's
+// platform commands) and seen by another, the subscription lifecycle (including its end from
+// inside its own callback), and the query's corner cases.
 #include "platform/statenotify/statenotify.h"
 #include "platform/statenotify/statenotifypublish.h"
 #include "tests/common/testsupport.h"
@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include <mutex>
+#include <string>
 #include <thread>
 #include <vector>
 
@@ -16,7 +17,6 @@ using platformtest::NewStateName;
 
 namespace
 {
-const NTSTATUS c_statusInvalidParameter = static_cast<NTSTATUS>(STATUS_INVALID_PARAMETER);
 const WNF_TYPE_ID c_typeId = {
     {0x6d1f2a10, 0x3c4b, 0x4e5f, {0x80, 0x91, 0xa2, 0xb3, 0xc4, 0xd5, 0xe6, 0xf7}}};
 
@@ -77,8 +77,6 @@ public:
 
     // Runs inside the callback, before the delivery is recorded.
     void (*m_pfnDuring)(CDeliveryLog *pLog) = nullptr;
-    PWNF_USER_SUBSCRIPTION m_pSubscription = nullptr;
-    NTSTATUS m_statusInCallback = -1;
 
 private:
     mutable std::mutex m_lock;
@@ -90,18 +88,6 @@ HRESULT PublishValue(WNF_STATE_NAME stateName, DWORD dwValue, WNF_CHANGE_STAMP *
     return StateNotifyPublish(stateName, &dwValue, sizeof(dwValue), pStamp);
 }
 
-// Publishes from a process of its own, as the phone's components do.
-void PublishFromChild(WNF_STATE_NAME stateName, DWORD dwValue, WNF_CHANGE_STAMP stampExpected)
-{
-    testsupport::ChildResult result =
-        testsupport::RunTelvanectl(L"platform state " + platformtest::StateNameText(stateName) +
-                                   L" " + std::to_wstring(dwValue));
-    ASSERT_EQ(0u, result.dwExitCode) << result.strOutput;
-    EXPECT_NE(std::string::npos,
-              result.strOutput.find("(change stamp " + std::to_string(stampExpected) + ")"))
-        << result.strOutput;
-}
-
 PWNF_USER_SUBSCRIPTION Subscribe(WNF_STATE_NAME stateName, WNF_CHANGE_STAMP stamp,
                                  CDeliveryLog *pLog, PCWNF_TYPE_ID pTypeId = nullptr)
 {
@@ -110,16 +96,24 @@ PWNF_USER_SUBSCRIPTION Subscribe(WNF_STATE_NAME stateName, WNF_CHANGE_STAMP stam
               RtlSubscribeWnfStateChangeNotification(&pSubscription, stateName, stamp,
                                                      CDeliveryLog::Callback, pLog, pTypeId, 0, 0));
     EXPECT_NE(nullptr, pSubscription);
-    pLog->m_pSubscription = pSubscription;
     return pSubscription;
+}
+
+// The 32-bit value the query reads (0xFFFFFFFF when unpublished), and its stamp.
+DWORD QueryValue(WNF_STATE_NAME stateName, WNF_CHANGE_STAMP *pStamp)
+{
+    DWORD dwValue = 0xFFFFFFFF;
+    ULONG cb = sizeof(dwValue);
+    EXPECT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, pStamp, &dwValue, &cb));
+    EXPECT_EQ(*pStamp == 0 ? 0u : sizeof(DWORD), cb);
+    return dwValue;
 }
 
 WNF_CHANGE_STAMP StampOf(WNF_STATE_NAME stateName)
 {
     WNF_CHANGE_STAMP stamp = 0;
-    BYTE rgb[WNF_STATE_MAX_DATA_SIZE];
-    ULONG cb = sizeof(rgb);
-    EXPECT_EQ(STATUS_SUCCESS, NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, rgb, &cb));
+    QueryValue(stateName, &stamp);
     return stamp;
 }
 
@@ -139,38 +133,13 @@ void ExpectNoMoreDeliveries(WNF_STATE_NAME stateName, const CDeliveryLog &ended)
 }
 } // namespace
 
-TEST(StateNotify, UnpublishedStateReadsAsNeverPublished)
-{
-    WNF_STATE_NAME stateName = NewStateName();
-    DWORD dwValue = 0xCCCCCCCC;
-    ULONG cb = sizeof(dwValue);
-    WNF_CHANGE_STAMP stamp = 99;
-    EXPECT_EQ(STATUS_SUCCESS,
-              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, &dwValue, &cb));
-    EXPECT_EQ(0u, stamp);
-    EXPECT_EQ(0u, cb);
-    EXPECT_EQ(0xCCCCCCCCu, dwValue);
-
-    // A subscriber creates the state's key to watch it; the state still reads unpublished.
-    CDeliveryLog log;
-    PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
-    cb = 0;
-    stamp = 99;
-    EXPECT_EQ(STATUS_SUCCESS,
-              NtQueryWnfStateData(&stateName, &c_typeId, nullptr, &stamp, nullptr, &cb));
-    EXPECT_EQ(0u, stamp);
-    EXPECT_EQ(0u, cb);
-    EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
-    EXPECT_EQ(0u, log.Count());
-}
-
 TEST(StateNotify, RefusesMissingArguments)
 {
     WNF_STATE_NAME stateName = NewStateName();
     DWORD dwValue = 0;
     ULONG cb = sizeof(dwValue);
     WNF_CHANGE_STAMP stamp = 0;
-    const NTSTATUS c_status = c_statusInvalidParameter;
+    const NTSTATUS c_status = static_cast<NTSTATUS>(STATUS_INVALID_PARAMETER);
     EXPECT_EQ(c_status, NtQueryWnfStateData(nullptr, nullptr, nullptr, &stamp, &dwValue, &cb));
     EXPECT_EQ(c_status,
               NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, &dwValue, nullptr));
@@ -200,7 +169,14 @@ TEST(StateNotify, QueryReturnsTheLatestPublicationWithItsStamp)
     {
         vbFull[i] = static_cast<BYTE>(i * 7);
     }
-    WNF_CHANGE_STAMP stamp = 0;
+    // Never published: stamp 0 and no data, the buffer untouched.
+    WNF_CHANGE_STAMP stamp = 99;
+    ULONG cb = static_cast<ULONG>(vbFull.size());
+    EXPECT_EQ(STATUS_SUCCESS,
+              NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, vbFull.data(), &cb));
+    EXPECT_EQ(0u, stamp);
+    EXPECT_EQ(0u, cb);
+    EXPECT_EQ(7, vbFull[1]);
     ASSERT_HRESULT_SUCCEEDED(StateNotifyPublish(stateName, nullptr, 0, &stamp));
     EXPECT_EQ(1u, stamp);
     ASSERT_HRESULT_SUCCEEDED(
@@ -210,7 +186,7 @@ TEST(StateNotify, QueryReturnsTheLatestPublicationWithItsStamp)
               StateNotifyPublish(stateName, vbFull.data(), WNF_STATE_MAX_DATA_SIZE + 1, nullptr));
 
     std::vector<BYTE> vbRead(WNF_STATE_MAX_DATA_SIZE + 16, 0xEE);
-    ULONG cb = static_cast<ULONG>(vbRead.size());
+    cb = static_cast<ULONG>(vbRead.size());
     stamp = 0;
     ASSERT_EQ(STATUS_SUCCESS,
               NtQueryWnfStateData(&stateName, nullptr, nullptr, &stamp, vbRead.data(), &cb));
@@ -258,34 +234,94 @@ TEST(StateNotify, ConcurrentPublishersRaiseTheStampOncePerPublication)
     EXPECT_EQ(static_cast<WNF_CHANGE_STAMP>(c_cThreads * c_cEach + 1), StampOf(stateName));
 }
 
-// Each publication of another process reaches the subscriber, and an unsubscribe while
-// idle ends the deliveries.
-TEST(StateNotify, SubscriberSeesEachPublicationOfAnotherProcess)
+TEST(TelvanectlPlatform, RefusesBadArgumentsAndPublishesNothing)
 {
     WNF_STATE_NAME stateName = NewStateName();
+    const std::wstring wstrState = L"platform state " + platformtest::StateNameText(stateName);
+    struct Case
+    {
+        std::wstring wstrArgs;
+        const char *szProblem;
+    };
+    const Case rgCases[] = {
+        {L"platform state", "needs a state NAME"},
+        {L"platform state zz 1", "needs a state NAME"},
+        {L"platform state 0x10000000000000000 1", "needs a state NAME"},
+        {wstrState + L" -1", "VALUE must be"},
+        {wstrState + L" 4294967296", "VALUE must be"},
+        {wstrState + L" 0x", "VALUE must be"},
+        {wstrState + L" 12abc", "VALUE must be"},
+        {wstrState + L" 1 2", "too many arguments"},
+        {L"platform backlight 1 2", "too many arguments"},
+        {L"platform power on", "VALUE must be"},
+    };
+    for (const Case &c : rgCases)
+    {
+        SCOPED_TRACE(testsupport::Narrow(c.wstrArgs));
+        testsupport::ChildResult result = testsupport::RunTelvanectl(c.wstrArgs);
+        EXPECT_EQ(2u, result.dwExitCode);
+        EXPECT_NE(std::string::npos, result.strOutput.find(c.szProblem)) << result.strOutput;
+    }
+    WNF_CHANGE_STAMP stamp = 0;
+    QueryValue(stateName, &stamp);
+    EXPECT_EQ(0u, stamp);
+}
+
+// What telvanectl publishes from a process of its own, as the phone's components do, reaches
+// a subscriber (on a thread of the pool, with its type id) and the query, and shows again;
+// an unsubscribe while idle ends the deliveries. Data of another size shows as bytes.
+TEST(TelvanectlPlatform, StatePublishesToSubscribersAndShows)
+{
+    WNF_STATE_NAME stateName = NewStateName();
+    const std::wstring wstrState = L"platform state " + platformtest::StateNameText(stateName);
+    const std::string strLabel =
+        "state " + testsupport::Narrow(platformtest::StateNameText(stateName));
+    // A subscriber creates the state's key to watch it; the state still reads unpublished.
     CDeliveryLog log;
     PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log, &c_typeId);
-    const DWORD rgdwValues[] = {5, 0, 7};
-    for (DWORD i = 0; i < ARRAYSIZE(rgdwValues); i++)
+    EXPECT_EQ(strLabel + ": not published\r\n", testsupport::RunTelvanectl(wstrState).strOutput);
+
+    struct Case
     {
-        PublishFromChild(stateName, rgdwValues[i], i + 1);
+        const wchar_t *wszValue;
+        DWORD dwExpected;
+    };
+    const Case rgCases[] = {
+        {L"5", 5}, {L"0", 0}, {L"4294967295", 0xFFFFFFFF}, {L"0x1F", 31}, {L"0XaB", 171}};
+    WNF_CHANGE_STAMP stamp = 0;
+    for (const Case &c : rgCases)
+    {
+        SCOPED_TRACE(testsupport::Narrow(c.wszValue));
+        stamp++;
+        const std::string strLine = strLabel + " = " + std::to_string(c.dwExpected) +
+                                    " (change stamp " + std::to_string(stamp) + ")\r\n";
+        testsupport::ChildResult result = testsupport::RunTelvanectl(wstrState + L" " + c.wszValue);
+        EXPECT_EQ(0u, result.dwExitCode);
+        EXPECT_EQ(strLine, result.strOutput);
         // Each publication is awaited before the next, so none is folded into another.
-        ASSERT_TRUE(log.WaitForCount(i + 1)) << "publication " << i + 1;
+        ASSERT_TRUE(log.WaitForCount(stamp));
+        WNF_CHANGE_STAMP stampRead = 0;
+        EXPECT_EQ(c.dwExpected, QueryValue(stateName, &stampRead));
+        EXPECT_EQ(stamp, stampRead);
+        EXPECT_EQ(strLine, testsupport::RunTelvanectl(wstrState).strOutput);
     }
     EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
-
     std::vector<Delivery> rg = log.Deliveries();
-    ASSERT_EQ(ARRAYSIZE(rgdwValues), rg.size());
+    ASSERT_EQ(ARRAYSIZE(rgCases), rg.size());
     for (size_t i = 0; i < rg.size(); i++)
     {
         EXPECT_EQ(stateName, rg[i].stateName);
         EXPECT_EQ(i + 1, rg[i].stamp);
-        EXPECT_EQ(rgdwValues[i], rg[i].dwValue);
+        EXPECT_EQ(rgCases[i].dwExpected, rg[i].dwValue);
         EXPECT_TRUE(rg[i].fTypeId);
-        // On a thread of the pool, never the subscriber's own.
         EXPECT_NE(GetCurrentThreadId(), rg[i].dwThreadId);
     }
     ExpectNoMoreDeliveries(stateName, log);
+
+    const BYTE rgb[] = {0x01, 0xA2};
+    ASSERT_HRESULT_SUCCEEDED(StateNotifyPublish(stateName, rgb, sizeof(rgb), nullptr));
+    EXPECT_EQ(strLabel + " = 2 bytes: 01 a2 (change stamp " + std::to_string(stamp + 3) + ")\r\n",
+              testsupport::RunTelvanectl(wstrState).strOutput);
 }
 
 TEST(StateNotify, SubscriptionStartsAfterTheStampItIsGiven)
@@ -327,25 +363,6 @@ TEST(StateNotify, SubscriptionStartsAfterTheStampItIsGiven)
     }
 }
 
-TEST(StateNotify, UnsubscribeInsideItsOwnCallbackDoesNotWaitForItself)
-{
-    WNF_STATE_NAME stateName = NewStateName();
-    CDeliveryLog log;
-    // What the service's launcher does when its destroy request is handled on the thread
-    // that posted the notification.
-    log.m_pfnDuring = [](CDeliveryLog *pLog) {
-        pLog->m_statusInCallback =
-            RtlUnsubscribeWnfNotificationWaitForCompletion(pLog->m_pSubscription);
-    };
-    Subscribe(stateName, 0, &log);
-    PublishFromChild(stateName, 3, 1);
-    // A subscription waiting for itself would never come back to tell.
-    ASSERT_TRUE(log.WaitForCount(1));
-    EXPECT_EQ(STATUS_SUCCESS, log.m_statusInCallback);
-    ExpectNoMoreDeliveries(stateName, log);
-    EXPECT_EQ(1u, log.Count());
-}
-
 TEST(StateNotify, UnsubscribeFromAnotherThreadWaitsForTheRunningCallback)
 {
     WNF_STATE_NAME stateName = NewStateName();
@@ -375,25 +392,6 @@ TEST(StateNotify, UnsubscribeFromAnotherThreadWaitsForTheRunningCallback)
     EXPECT_EQ(1, fDoneWhenUnsubscribed);
     ExpectNoMoreDeliveries(stateName, log);
     EXPECT_EQ(1u, log.Count());
-}
-
-TEST(StateNotify, UnsubscribeRacingTheFirstDeliveryIsSafe)
-{
-    WNF_STATE_NAME stateName = NewStateName();
-    ASSERT_HRESULT_SUCCEEDED(PublishValue(stateName, 1));
-    for (int i = 0; i < 40; i++)
-    {
-        CDeliveryLog log;
-        PWNF_USER_SUBSCRIPTION pSubscription = Subscribe(stateName, 0, &log);
-        if (i % 2 == 1)
-        {
-            SwitchToThread();
-        }
-        EXPECT_EQ(STATUS_SUCCESS, RtlUnsubscribeWnfNotificationWaitForCompletion(pSubscription));
-        // The log goes out of scope here: a callback after the unsubscribe would touch freed
-        // memory.
-        EXPECT_LE(log.Count(), 1u);
-    }
 }
 
 // The service DLL may be unloaded as soon as its stop is reported, and its launcher ends its
