@@ -80,13 +80,12 @@ protected:
 };
 } // namespace
 
-TEST_F(CoreScm, ServesAndDrainsUnderSvchost)
+TEST_F(CoreScm, ServesAndDrainsUnderBothHosts)
 {
     ServeAndDrain(TelvaneHost::Svchost, L"svchost.exe");
-}
-
-TEST_F(CoreScm, ServesAndDrainsUnderTelvaneHost)
-{
+    TelvaneUninstall();
+    DeleteLogsOfRuns(m_rgLogIds);
+    m_rgLogIds.clear();
     ServeAndDrain(TelvaneHost::TelvaneHost, L"telvanehost.exe");
 }
 
