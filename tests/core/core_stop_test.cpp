@@ -1,6 +1,7 @@
 // A stop drains whatever is going on: no clients, clients in the middle of an event, a
 // collection outstanding, a retiring operation, clients still arriving (a hundred clients
-// connected at once: CoreScm, under the control manager). The fixture's stop checks that nothing is left and every tagged count is back to zero.
+// connected at once: CoreScm, under the control manager). The fixture's stop checks that nothing is
+// left and every tagged count is back to zero.
 #include "tests/core/coretest.h"
 #include "client/ccollectorclient.h"
 #include "inc/telvanepipe.h"

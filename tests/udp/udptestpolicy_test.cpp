@@ -183,14 +183,3 @@ TEST_F(UdpTestPolicy, FailedRefreshRetriesInAWeekAndSaves)
         EXPECT_EQ("2007", rgLines[2]);
     }
 }
-
-TEST(UdpTestPolicyTime, IsConfigExpired)
-{
-    UdpTestConfig config;
-    config.expiration = 0;
-    EXPECT_TRUE(IsConfigExpired(&config));
-    config.expiration = UdpConfigNow() + 600 * 10000000ull;
-    EXPECT_FALSE(IsConfigExpired(&config));
-    config.expiration = UdpConfigNow() - 10000000ull;
-    EXPECT_TRUE(IsConfigExpired(&config));
-}
