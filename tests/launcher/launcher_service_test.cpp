@@ -3,6 +3,7 @@
 // application against a loopback relay, and the coordinator's stop.
 #include "tests/launcher/launchertestsupport.h"
 #include "tests/common/coordinator.h"
+#include "service/udptestlaunch.h"
 #include "tests/common/policyserver.h"
 
 #include <algorithm>
@@ -152,6 +153,14 @@ TEST_F(LauncherServiceTest, BacklightChangeRunsTestThatHoldsTheStop)
             "-localIP 127.0.0.1 -count 250 127.0.0.1 " + std::to_string(c.usPort);
         EXPECT_EQ(CommandLine(strArguments), ChamberLastCommandLine());
         EXPECT_TRUE(m_trace.Contains("2008|" + Narrow(CommandLine(strArguments))));
+        // Started in the test application's own chamber.
+        std::wstring wstrSid, wstrInstance;
+        DWORD dwType = 0;
+        ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberSid", &dwType, &wstrSid));
+        ASSERT_TRUE(
+            HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberInstance", &dwType, &wstrInstance));
+        EXPECT_EQ(0u, wstrSid.rfind(L"S-1-15-2-", 0));
+        EXPECT_STREQ(c_wszUdpTestChamberInstance, wstrInstance.c_str());
         EXPECT_EQ(c.fSaveFails, m_trace.Contains("2001|CreateFile (write)|80070005"))
             << "the failed save is traced";
         // The start is remembered in the saved policy, with the rest of it unchanged.
