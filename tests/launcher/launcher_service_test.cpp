@@ -56,19 +56,6 @@ protected:
         ASSERT_TRUE(m_trace.WaitForLine(c_szHandlerToggled, cToggled + 1));
     }
 
-    // An open policy for a loopback relay on usPort that echoes cPackets, the service started
-    // and the backlight changed: returns once the test application was launched.
-    void LaunchAgainstRelay(USHORT usPort, unsigned cPackets)
-    {
-        WritePolicyFile(
-            {{"RelayPort", std::to_string(usPort)}, {"NumPackets", std::to_string(cPackets)}});
-        m_pRelay.reset(new CRelayProcess(usPort, L"-packets " + std::to_wstring(cPackets)));
-        ASSERT_TRUE(m_pRelay->Listening());
-        StartService();
-        ToggleBacklight({0, 0, 0, 0});
-        ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
-    }
-
     // The relay's report once the application sent all it was to send.
     static std::string Echoed(unsigned cPackets)
     {
@@ -125,32 +112,65 @@ TEST_F(LauncherServiceTest, BacklightValuesAndShortData)
 }
 
 // A backlight change runs the test against the policy's relay and remembers the start in the
-// saved policy. While the test application runs, changes are ignored and a stop waits for it
-// to end by itself; so too after the policy could not be saved, since the process is tracked
-// anyway.
+// saved policy; an expired policy is first fetched from the web service, with the device
+// certificate, and the answer is what the gates judge (what the refresh saves is
+// UdpTestRefresh's). While the test application runs, changes are ignored and a stop waits for
+// it to end by itself; so too after the policy could not be saved, since the process is
+// tracked anyway.
 TEST_F(LauncherServiceTest, BacklightChangeRunsTestThatHoldsTheStop)
 {
+    const USHORT usServerPort = 47330;
     const struct
     {
         const char *szName;
+        bool fRefresh;
         bool fSaveFails;
         USHORT usPort;
-    } rgCases[] = {{"saved", false, 47303}, {"save failed", true, 47304}};
+    } rgCases[] = {{"expired and refreshed", true, false, 47303},
+                   {"save failed", false, true, 47304}};
     for (const auto &c : rgCases)
     {
         SCOPED_TRACE(c.szName);
         PreparePrefix();
         m_trace.Clear();
+        const std::string strPort = std::to_string(c.usPort);
+        CTestPolicyServer server;
+        if (c.fRefresh)
+        {
+            WritePolicyFile({{"Enabled", "false"},
+                             {"RelayPort", "47399"},
+                             {"Expiration", std::to_string(UdpConfigNow() - 10000000)}});
+            PolicyServerOptions options;
+            options.usPort = usServerPort;
+            options.fUseBody = true;
+            options.strBody =
+                "{\"Enabled\":\"true\",\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":" + strPort +
+                ",\"NumPackets\":250,\"MaxTestDay\":24,\"Policy\":\"BattAC\","
+                "\"DurationValid\":\"P1D\"}";
+            ASSERT_TRUE(server.Start(options));
+            HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
+                          L"https://localhost:" + std::to_wstring(usServerPort) + L"/");
+            Publish(c_ullPowerSourceStateName, 1); // the answer allows battery power
+        }
+        else
+        {
+            WritePolicyFile({{"RelayPort", strPort}, {"NumPackets", "250"}});
+        }
         if (c.fSaveFails)
         {
             // A folder where the new policy would be written makes every save fail.
             ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr));
         }
+        m_pRelay.reset(new CRelayProcess(c.usPort, L"-packets 250")); // five seconds of sending
+        ASSERT_TRUE(m_pRelay->Listening());
         DWORD cLaunches = ChamberLaunchCount();
         ULONGLONG ullBefore = UdpConfigNow();
-        LaunchAgainstRelay(c.usPort, 250); // five seconds of sending
-        const std::string strArguments =
-            "-localIP 127.0.0.1 -count 250 127.0.0.1 " + std::to_string(c.usPort);
+        StartService();
+        ToggleBacklight({0, 0, 0, 0});
+        ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
+        EXPECT_EQ(c.fRefresh ? 1u : 0u, m_trace.CountLines("2005")) << "refreshed";
+        EXPECT_FALSE(m_trace.Contains(c_szConfigExpired)) << "refreshed once, at the first load";
+        const std::string strArguments = "-localIP 127.0.0.1 -count 250 127.0.0.1 " + strPort;
         EXPECT_EQ(CommandLine(strArguments), ChamberLastCommandLine());
         EXPECT_TRUE(m_trace.Contains("2008|" + Narrow(CommandLine(strArguments))));
         // Started in the test application's own chamber.
@@ -168,7 +188,7 @@ TEST_F(LauncherServiceTest, BacklightChangeRunsTestThatHoldsTheStop)
         size_t ichLastTest = strSaved.find("\"LastTest\":");
         ASSERT_NE(std::string::npos, ichLastTest) << strSaved;
         EXPECT_EQ(!c.fSaveFails, ullBefore <= std::stoull(strSaved.substr(ichLastTest + 11)));
-        EXPECT_NE(std::string::npos, strSaved.find("\"RelayPort\":" + std::to_string(c.usPort)));
+        EXPECT_NE(std::string::npos, strSaved.find("\"RelayPort\":" + strPort)) << strSaved;
         ASSERT_TRUE(ResultFiles().empty()) << "the test ended before the next change";
         ToggleBacklight({0, 0, 0, 0});
         ToggleBacklight({2, 0, 0, 0});
@@ -182,40 +202,6 @@ TEST_F(LauncherServiceTest, BacklightChangeRunsTestThatHoldsTheStop)
         EXPECT_EQ(Echoed(250), m_pRelay->WaitForReport());
         EXPECT_EQ(cLaunches + 1, ChamberLaunchCount());
     }
-}
-
-// An expired policy is fetched from the web service, with the device certificate, before the
-// gates are judged, and the answer's relay is the one tested (what the refresh saves is the
-// UDP suite's to check).
-TEST_F(LauncherServiceTest, ExpiredPolicyIsRefreshedFromWebService)
-{
-    const USHORT usServerPort = 47330;
-    WritePolicyFile({{"Enabled", "false"},
-                     {"RelayPort", "47399"},
-                     {"Expiration", std::to_string(UdpConfigNow() - 10000000)}}); // a second ago
-    PolicyServerOptions options;
-    options.usPort = usServerPort;
-    options.fUseBody = true;
-    options.strBody = "{\"Enabled\":\"true\",\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":47331,"
-                      "\"NumPackets\":10,\"MaxTestDay\":24,\"Policy\":\"BattAC\","
-                      "\"DurationValid\":\"P1D\"}";
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(options));
-    HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                  L"https://localhost:" + std::to_wstring(usServerPort) + L"/");
-    Publish(c_ullPowerSourceStateName, 1); // the answer allows battery power
-    CRelayProcess relay(47331, L"-packets 10");
-    ASSERT_TRUE(relay.Listening());
-    StartService();
-
-    ToggleBacklight({0, 0, 0, 0});
-    ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
-    EXPECT_EQ(Echoed(10), relay.WaitForReport());
-    EXPECT_EQ(CommandLine("-localIP 127.0.0.1 -count 10 127.0.0.1 47331"),
-              ChamberLastCommandLine());
-    EXPECT_EQ(1u, server.Requests().size());
-    EXPECT_EQ(1u, m_trace.CountLines("2005")) << "refreshed";
-    EXPECT_FALSE(m_trace.Contains(c_szConfigExpired)) << "refreshed once, at the first load";
 }
 
 // Every gate that refuses, and a launch step that fails, traces why and starts nothing. How
