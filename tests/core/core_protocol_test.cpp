@@ -14,59 +14,56 @@ namespace
 {
 typedef std::vector<BYTE> Message;
 
-// Writes the bytes at ib (little-endian, as the wire has them), growing the message to hold them.
-template <typename T>
-void Put(Message &m, size_t ib, const T &value)
+TELVANE_GUID Wire(const GUID &id)
 {
-    m.resize(std::max(m.size(), ib + sizeof(value)));
-    std::memcpy(m.data() + ib, &value, sizeof(value));
+    TELVANE_GUID wire;
+    std::memcpy(&wire, &id, sizeof(wire));
+    return wire;
 }
 
-// Each builder makes the whole message; cb then cuts or pads it to that length.
+// The header's bytes, then the payload's, cut or padded to cb bytes (SIZE_MAX: as built).
+template <typename T>
+Message Bytes(const T &header, size_t cb, const std::string &payload = "")
+{
+    Message m(sizeof(T) + payload.size());
+    std::memcpy(m.data(), &header, sizeof(T));
+    std::copy(payload.begin(), payload.end(), m.begin() + sizeof(T));
+    m.resize(cb == SIZE_MAX ? m.size() : cb);
+    return m;
+}
+
 Message Opcode(uint32_t ulOpcode, size_t cb = 4)
 {
-    Message m;
-    Put(m, 0, ulOpcode);
-    m.resize(cb);
-    return m;
+    return Bytes(TELVANE_PACKET{ulOpcode}, cb);
 }
 
 Message StartMessage(const GUID &activityId, const GUID &logId, size_t cb = 36)
 {
-    Message m = Opcode(TELVANE_START_ACTIVITY_OPCODE);
-    Put(m, 4, activityId);
-    Put(m, 20, logId);
-    m.resize(cb);
-    return m;
+    return Bytes(
+        TELVANE_START_ACTIVITY{TELVANE_START_ACTIVITY_OPCODE, Wire(activityId), Wire(logId)}, cb);
 }
 
 // An event part: header, payload, trailer.
 Message EventPart(const GUID &eventId, bool fComplete, const std::string &payload,
                   size_t cb = SIZE_MAX)
 {
-    Message m = Opcode(TELVANE_ACTIVITY_EVENT_OPCODE, 32 + payload.size());
-    Put(m, 4, eventId);
-    Put(m, 20, static_cast<uint32_t>(fComplete ? 1 : 0));
-    Put(m, 24, static_cast<uint32_t>(payload.size()));
-    std::memcpy(m.data() + 28, payload.data(), payload.size());
-    m.resize(cb == SIZE_MAX ? m.size() : cb);
-    return m;
+    TELVANE_ACTIVITY_EVENT header = {TELVANE_ACTIVITY_EVENT_OPCODE, Wire(eventId), fComplete,
+                                     static_cast<uint32_t>(payload.size())};
+    return Bytes(header, cb == SIZE_MAX ? TELVANE_ACTIVITY_EVENT_OVERHEAD + payload.size() : cb,
+                 payload);
 }
 
 Message Register(const GUID &collectorId, size_t cb = 20)
 {
-    Message m = Opcode(TELVANE_REGISTER_COLLECTOR_OPCODE);
-    Put(m, 4, collectorId);
-    m.resize(cb);
-    return m;
+    return Bytes(TELVANE_REGISTER_COLLECTOR{TELVANE_REGISTER_COLLECTOR_OPCODE, Wire(collectorId)},
+                 cb);
 }
 
 Message ResultPart(bool fComplete, uint32_t cbLength, size_t cbPayload)
 {
-    Message m = Opcode(TELVANE_COLLECTION_COMPLETE_OPCODE, 12 + cbPayload);
-    Put(m, 4, static_cast<uint32_t>(fComplete ? 1 : 0));
-    Put(m, 8, cbLength);
-    return m;
+    return Bytes(
+        TELVANE_COLLECTION_COMPLETE{TELVANE_COLLECTION_COMPLETE_OPCODE, fComplete, cbLength},
+        sizeof(TELVANE_COLLECTION_COMPLETE) + cbPayload);
 }
 
 // Where a fault is sent: after the version exchange on either pipe, or on an activity
