@@ -73,44 +73,6 @@ protected:
 };
 } // namespace
 
-// A value of 1 does nothing beyond the two trace lines; any other value, and data too short to
-// hold a value, runs the checks (here the policy's "Not enabled"). After the stop the launcher
-// no longer hears the backlight.
-TEST_F(LauncherServiceTest, BacklightValuesAndShortData)
-{
-    WritePolicyFile({{"Enabled", "false"}});
-    StartService();
-    const struct
-    {
-        std::vector<BYTE> vbData;
-        bool fChecks;
-    } rgCases[] = {
-        {{1, 0, 0, 0}, false}, {{0, 0, 0, 0}, true},
-        {{2, 0, 0, 0}, true},  {{1, 0, 0, 0, 7, 7}, false}, // only the first value counts
-        {{1, 0}, true},        {{}, true},
-    };
-    size_t cChecks = 0;
-    for (const auto &c : rgCases)
-    {
-        ToggleBacklight(c.vbData);
-        if (c.fChecks)
-        {
-            cChecks++;
-            ASSERT_TRUE(m_trace.WaitForLine(c_szNotAsked, cChecks)) << c.vbData.size();
-        }
-    }
-    StopService(); // drains the launcher's queue: nothing more is on its way
-    EXPECT_EQ(cChecks, m_trace.CountLines(c_szNotAsked));
-    EXPECT_EQ(cChecks, m_trace.CountLines("2001|Not enabled|0"));
-    EXPECT_EQ(1u, m_trace.CountLines(c_szLoadingConfig)); // the file is read once
-    EXPECT_EQ(1u, m_trace.CountLines(c_szFinishedDestruction));
-
-    size_t cCallbacks = m_trace.CountLines(c_szCallbackToggled);
-    Publish(c_ullBacklightStateName, 0);
-    Sleep(200);
-    EXPECT_EQ(cCallbacks, m_trace.CountLines(c_szCallbackToggled));
-}
-
 // A backlight change runs the test against the policy's relay and remembers the start in the
 // saved policy; an expired policy is first fetched from the web service, with the device
 // certificate, and the answer is what the gates judge (what the refresh saves is
@@ -207,6 +169,9 @@ TEST_F(LauncherServiceTest, BacklightChangeRunsTestThatHoldsTheStop)
 // Every gate that refuses, and a launch step that fails, traces why and starts nothing. How
 // each gate judges its values (the relay's name, the spacing of tests, the Wi-Fi stand-in's
 // failures, the launch's other failures) is the UDP suites' to check; here one row per gate.
+// A backlight value of 1 does nothing beyond the two trace lines; any other value, and data
+// too short to hold a value, runs the checks, with the policy file read once. After the stop
+// the launcher no longer hears the backlight.
 TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
 {
     const std::string strOneHourAgo = std::to_string(UdpConfigNow() - c_ullDay / 24);
@@ -224,8 +189,13 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         PolicyMembers policy;                // replaces members of the open policy
         std::function<void()> pfnPrefix;     // changes the open prefix
         std::vector<std::string> rgExpected; // the failure lines, in this order
+        std::vector<std::vector<BYTE>> rgToggles = {{0, 0, 0, 0}}; // the backlight's values
     } rgCases[] = {
-        {"disabled", {{"Enabled", "false"}}, nullptr, {szNotEnabled}},
+        {"disabled, backlight values",
+         {{"Enabled", "false"}},
+         nullptr,
+         {szNotEnabled, szNotEnabled, szNotEnabled, szNotEnabled},
+         {{1, 0, 0, 0}, {0, 0, 0, 0}, {2, 0, 0, 0}, {1, 0, 0, 0, 7, 7}, {1, 0}, {}}},
         // The reader gives a saved empty name back as null.
         {"empty relay", {{"RelayFQDN", "\"\""}}, nullptr, {szNoRelay}},
         {"relay port 0", {{"RelayPort", "0"}}, nullptr, {szNoRelay}},
@@ -262,8 +232,13 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         m_trace.Clear();
         StartService();
 
-        ToggleBacklight({0, 0, 0, 0});
+        for (const std::vector<BYTE> &vbData : c.rgToggles)
+        {
+            ToggleBacklight(vbData);
+        }
         StopService(); // every handler has run when the launcher is destroyed
+        EXPECT_EQ(1u, m_trace.CountLines(c_szLoadingConfig));
+        EXPECT_EQ(1u, m_trace.CountLines(c_szFinishedDestruction));
         std::vector<std::string> rgLines = m_trace.Lines(), rgFailures;
         std::copy_if(
             rgLines.begin(), rgLines.end(), std::back_inserter(rgFailures),
@@ -272,4 +247,8 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         EXPECT_FALSE(m_trace.Contains(c_szLaunched));
         EXPECT_EQ(cLaunches, ChamberLaunchCount());
     }
+    size_t cCallbacks = m_trace.CountLines(c_szCallbackToggled);
+    Publish(c_ullBacklightStateName, 0);
+    Sleep(200);
+    EXPECT_EQ(cCallbacks, m_trace.CountLines(c_szCallbackToggled));
 }

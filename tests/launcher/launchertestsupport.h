@@ -35,8 +35,6 @@ const char c_szLoadingConfig[] =
     LAUNCHER_LINE("Dispatch_BacklightChangedup  () - loading UDP config");
 const char c_szConfigExpired[] =
     LAUNCHER_LINE("Dispatch_BacklightChangedup  () - config expired, refreshing");
-const char c_szNotAsked[] =
-    LAUNCHER_LINE("Dispatch_BacklightChangedup  () - asked not to run test");
 const char c_szLaunched[] = LAUNCHER_LINE("Dispatch_BacklightChangedup  () - UDP app launched");
 const char c_szStillRunning[] =
     LAUNCHER_LINE("Dispatch_BacklightChanged() - process is still running, ignoring this call");
