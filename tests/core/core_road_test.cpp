@@ -41,14 +41,8 @@ TEST_F(CoreRoad, OneActivityWithOneCollectorIsDeliveredWhole)
     std::sort(rgExpectedGroups.begin(), rgExpectedGroups.end());
     EXPECT_EQ(rgExpectedGroups, rgGroups);
     EXPECT_EQ("LogEnd", rgNames.back());
-    EXPECT_EQ(36u, std::string(log["SessionID"].GetString()).size());
-    EXPECT_EQ(24u, log["JsonVersion"].GetUint());
-    EXPECT_TRUE(log["TimeStamp"].IsUint64());
-    EXPECT_TRUE(log["ExecutionTime"].IsUint64());
+    // The header's values are TraceDocumentTest's; a run's single log is also its last.
     EXPECT_GE(log["ExecutionTime"].GetUint64(), log["TimeStamp"].GetUint64());
-    EXPECT_TRUE(log["Orvex"].IsObject());
-    EXPECT_TRUE(log["Phone"].IsObject());
-
     EXPECT_EQ(GuidText(activityId), log["ActivityID"].GetString());
     EXPECT_EQ(GuidText(logId), log["LogID"].GetString());
     EXPECT_EQ(1u, log["LogCount"].GetUint());
