@@ -63,7 +63,7 @@ TEST_F(CoreCoordinator, DuplicateActivityIdRetiresTheFirstAndDeliversBoth)
             }
         }
         std::sort(rgValues.begin(), rgValues.end());
-        EXPECT_EQ(fSameLog ? std::vector<std::string>{"1", "2"} : std::vector<std::string>{"2"},
+        EXPECT_EQ((fSameLog ? std::vector<std::string>{"1", "2"} : std::vector<std::string>{"2"}),
                   rgValues);
     }
     EXPECT_EQ(2u, m_trace.Count("**TelvaneService::ReportConnectectedActivity() - destroying our "
