@@ -80,11 +80,12 @@ protected:
 };
 } // namespace
 
-TEST_F(CoreScm, ServesAndDrainsUnderBothHosts)
+TEST_F(CoreScm, ServesAndDrainsUnderSvchost)
 {
     ServeAndDrain(TelvaneHost::Svchost, L"svchost.exe");
-    TelvaneUninstall();
-    DeleteLogsOfRuns(m_rgLogIds);
-    m_rgLogIds.clear();
+}
+
+TEST_F(CoreScm, ServesAndDrainsUnderTelvaneHost)
+{
     ServeAndDrain(TelvaneHost::TelvaneHost, L"telvanehost.exe");
 }
