@@ -12,23 +12,6 @@ namespace
 class CoreCoordinator : public CCoreTest
 {
 protected:
-    // A first run of the activity with one event recorded, then a second start of the same
-    // activity (under logSecond), which retires the first and ends its connection.
-    std::unique_ptr<CActivityClient> RestartActivity(const GUID &logFirst, const GUID &logSecond,
-                                                     const GUID &eventId, const char *szFirst)
-    {
-        GUID activityId = NewGuid();
-        std::unique_ptr<CActivityClient> first = StartActivity(activityId, logFirst);
-        SendEvent(*first, eventId, szFirst);
-        WaitForStarts(1);
-        // Recorded before the second start; an event still on its way when the first run is
-        // retired would be dropped with its connection.
-        EXPECT_TRUE(m_trace.WaitFor(c_szActivityEvent, 1));
-        std::unique_ptr<CActivityClient> second = StartActivity(activityId, logSecond);
-        EXPECT_TRUE(ClosedByService(first->Pipe()));
-        return second;
-    }
-
     // Three runs that all want the one collector, which holds its first request.
     std::vector<std::unique_ptr<CActivityClient>> ThreeRunsWaiting(CCollectorThread &collector,
                                                                    std::vector<GUID> *prgLogIds)
@@ -46,46 +29,45 @@ protected:
 };
 } // namespace
 
+// A second start of a running activity retires the first run, which is delivered, and ends its
+// connection; with the LogID reused too, each run's end reaches its own operation.
 TEST_F(CoreCoordinator, DuplicateActivityIdRetiresTheFirstAndDeliversBoth)
 {
-    GUID logFirst = NewGuid();
-    GUID logSecond = NewGuid();
-    GUID eventId = NewGuid();
-    std::unique_ptr<CActivityClient> second = RestartActivity(logFirst, logSecond, eventId, "1");
-    SendEvent(*second, eventId, "2");
-    // The first run is retired: its log is delivered.
-    EXPECT_EQ((std::vector<std::string>{"1"}), OnlyLogValues(logFirst, eventId));
-    EXPECT_EQ(1u, m_trace.Count("**TelvaneService::ReportConnectectedActivity() - destroying our "
-                                "old active Operations because of duplicate activty type ID's"));
-
-    SendEvent(*second, eventId, "3");
-    EXPECT_EQ(S_OK, second->Stop());
-    EXPECT_EQ((std::vector<std::string>{"2", "3"}), OnlyLogValues(logSecond, eventId));
-}
-
-// Clients that reuse a LogID: each activity's end reaches its own operation and both complete.
-TEST_F(CoreCoordinator, ReusedLogIdOfTheSameActivityKeepsBothRuns)
-{
-    GUID logId = NewGuid();
-    GUID eventId = NewGuid();
-    std::unique_ptr<CActivityClient> second = RestartActivity(logId, logId, eventId, "\"first\"");
-    ASSERT_EQ(1u, WaitForLogs(logId, 1).size());
-    // Sent after the first run ended: it belongs to the second run alone.
-    SendEvent(*second, eventId, "\"second\"");
-    EXPECT_EQ(S_OK, second->Stop());
-    std::vector<DeliveredLog> rgLogs = WaitForLogs(logId, 2);
-    ASSERT_EQ(2u, rgLogs.size());
-    std::vector<std::string> rgValues;
-    for (const DeliveredLog &log : rgLogs)
+    for (bool fSameLog : {false, true})
     {
-        EXPECT_TRUE(EndsRun(*log.doc));
-        for (const std::string &value : GroupValues(*log.doc, eventId))
+        SCOPED_TRACE(fSameLog ? "same LogID" : "new LogID");
+        GUID activityId = NewGuid();
+        GUID logFirst = NewGuid();
+        GUID logSecond = fSameLog ? logFirst : NewGuid();
+        GUID eventId = NewGuid();
+        size_t cEvents = m_trace.Count(c_szActivityEvent);
+        std::unique_ptr<CActivityClient> first = StartActivity(activityId, logFirst);
+        SendEvent(*first, eventId, "1");
+        // Recorded before the second start; an event still on its way when the first run is
+        // retired would be dropped with its connection.
+        ASSERT_TRUE(m_trace.WaitFor(c_szActivityEvent, cEvents + 1));
+        std::unique_ptr<CActivityClient> second = StartActivity(activityId, logSecond);
+        EXPECT_TRUE(ClosedByService(first->Pipe()));
+        EXPECT_EQ((std::vector<std::string>{"1"}), OnlyLogValues(logFirst, eventId));
+        // Sent after the first run ended: it belongs to the second run alone.
+        SendEvent(*second, eventId, "2");
+        EXPECT_EQ(S_OK, second->Stop());
+        std::vector<DeliveredLog> rgLogs = WaitForLogs(logSecond, fSameLog ? 2 : 1);
+        std::vector<std::string> rgValues;
+        for (const DeliveredLog &log : rgLogs)
         {
-            rgValues.push_back(value);
+            EXPECT_TRUE(EndsRun(*log.doc));
+            for (const std::string &value : GroupValues(*log.doc, eventId))
+            {
+                rgValues.push_back(value);
+            }
         }
+        std::sort(rgValues.begin(), rgValues.end());
+        EXPECT_EQ((fSameLog ? std::vector<std::string>{"1", "2"} : std::vector<std::string>{"2"}),
+                  rgValues);
     }
-    std::sort(rgValues.begin(), rgValues.end());
-    EXPECT_EQ((std::vector<std::string>{"\"first\"", "\"second\""}), rgValues);
+    EXPECT_EQ(2u, m_trace.Count("**TelvaneService::ReportConnectectedActivity() - destroying our "
+                                "old active Operations because of duplicate activty type ID's"));
 }
 
 TEST_F(CoreCoordinator, ReusedLogIdOfTwoActivitiesIsDrainedByStop)

@@ -89,6 +89,4 @@ TEST(CoreReassemblyBudget, BoundsUnfinishedItemsOfAllConnections)
     EXPECT_EQ(cbBefore + vb.size(), PipeReassemblyServiceBudget().Used());
     item.Clear();
     EXPECT_EQ(cbBefore, PipeReassemblyServiceBudget().Used());
-    EXPECT_EQ(64ull * 1024 * 1024, TELVANE_MAX_PENDING_ITEMS);
-    EXPECT_EQ(4u * 1024 * 1024, TELVANE_MAX_ITEM);
 }

@@ -1,6 +1,7 @@
-// Every client fault of the wire protocol ends only that client's connection, with its trace;
-// messages a connection's state does not accept yet are dropped before any size check; and a
-// client that connects but never identifies itself keeps nobody else out.
+// Every kind of client fault ends only that client's connection, with its trace (which forms
+// are faults is PipeCodec's to judge); messages a connection's state does not accept yet are
+// dropped before any size check; and a client that connects but never identifies itself keeps
+// nobody else out.
 #include "tests/core/coretest.h"
 #include "servicelib/pipecodec.h"
 
@@ -13,59 +14,56 @@ namespace
 {
 typedef std::vector<BYTE> Message;
 
-// Writes the bytes at ib (little-endian, as the wire has them), growing the message to hold them.
-template <typename T>
-void Put(Message &m, size_t ib, const T &value)
+TELVANE_GUID Wire(const GUID &id)
 {
-    m.resize(std::max(m.size(), ib + sizeof(value)));
-    std::memcpy(m.data() + ib, &value, sizeof(value));
+    TELVANE_GUID wire;
+    std::memcpy(&wire, &id, sizeof(wire));
+    return wire;
 }
 
-// Each builder makes the whole message; cb then cuts or pads it to that length.
+// The header's bytes, then the payload's, cut or padded to cb bytes (SIZE_MAX: as built).
+template <typename T>
+Message Bytes(const T &header, size_t cb, const std::string &payload = "")
+{
+    Message m(sizeof(T) + payload.size());
+    std::memcpy(m.data(), &header, sizeof(T));
+    std::copy(payload.begin(), payload.end(), m.begin() + sizeof(T));
+    m.resize(cb == SIZE_MAX ? m.size() : cb);
+    return m;
+}
+
 Message Opcode(uint32_t ulOpcode, size_t cb = 4)
 {
-    Message m;
-    Put(m, 0, ulOpcode);
-    m.resize(cb);
-    return m;
+    return Bytes(TELVANE_PACKET{ulOpcode}, cb);
 }
 
 Message StartMessage(const GUID &activityId, const GUID &logId, size_t cb = 36)
 {
-    Message m = Opcode(TELVANE_START_ACTIVITY_OPCODE);
-    Put(m, 4, activityId);
-    Put(m, 20, logId);
-    m.resize(cb);
-    return m;
+    return Bytes(
+        TELVANE_START_ACTIVITY{TELVANE_START_ACTIVITY_OPCODE, Wire(activityId), Wire(logId)}, cb);
 }
 
 // An event part: header, payload, trailer.
 Message EventPart(const GUID &eventId, bool fComplete, const std::string &payload,
                   size_t cb = SIZE_MAX)
 {
-    Message m = Opcode(TELVANE_ACTIVITY_EVENT_OPCODE, 32 + payload.size());
-    Put(m, 4, eventId);
-    Put(m, 20, static_cast<uint32_t>(fComplete ? 1 : 0));
-    Put(m, 24, static_cast<uint32_t>(payload.size()));
-    std::memcpy(m.data() + 28, payload.data(), payload.size());
-    m.resize(cb == SIZE_MAX ? m.size() : cb);
-    return m;
+    TELVANE_ACTIVITY_EVENT header = {TELVANE_ACTIVITY_EVENT_OPCODE, Wire(eventId), fComplete,
+                                     static_cast<uint32_t>(payload.size())};
+    return Bytes(header, cb == SIZE_MAX ? TELVANE_ACTIVITY_EVENT_OVERHEAD + payload.size() : cb,
+                 payload);
 }
 
 Message Register(const GUID &collectorId, size_t cb = 20)
 {
-    Message m = Opcode(TELVANE_REGISTER_COLLECTOR_OPCODE);
-    Put(m, 4, collectorId);
-    m.resize(cb);
-    return m;
+    return Bytes(TELVANE_REGISTER_COLLECTOR{TELVANE_REGISTER_COLLECTOR_OPCODE, Wire(collectorId)},
+                 cb);
 }
 
 Message ResultPart(bool fComplete, uint32_t cbLength, size_t cbPayload)
 {
-    Message m = Opcode(TELVANE_COLLECTION_COMPLETE_OPCODE, 12 + cbPayload);
-    Put(m, 4, static_cast<uint32_t>(fComplete ? 1 : 0));
-    Put(m, 8, cbLength);
-    return m;
+    return Bytes(
+        TELVANE_COLLECTION_COMPLETE{TELVANE_COLLECTION_COMPLETE_OPCODE, fComplete, cbLength},
+        sizeof(TELVANE_COLLECTION_COMPLETE) + cbPayload);
 }
 
 // Where a fault is sent: after the version exchange on either pipe, or on an activity
@@ -115,17 +113,11 @@ TEST_F(CoreProtocol, EveryClientFaultClosesOnlyThatPipe)
     const std::vector<FaultCase> rgCases = {
         {"activity: 3 bytes", OnActivity, {Message(3)}, c_szPipeFaultActivitySize},
         {"start: 35 bytes", OnActivity, {StartMessage(a, l, 35)}, c_szPipeFaultActivityStartSize},
-        {"start: 37 bytes", OnActivity, {StartMessage(a, l, 37)}, c_szPipeFaultActivityStartSize},
         {"event: 31 bytes",
          OnActivity,
          {StartMessage(a, l), EventPart(e, true, "", 31)},
          c_szPipeFaultActivityEventSize},
-        {"event: 41 bytes with length 10",
-         OnActivity,
-         {StartMessage(a, l), EventPart(e, true, "0123456789", 41)},
-         c_szPipeFaultActivityEventSize},
         {"activity opcode 9", OnActivity, {Opcode(9)}, c_szPipeFaultActivityOpcode},
-        {"activity opcode 8", OnActivity, {Opcode(8)}, c_szPipeFaultActivityOpcode},
         {"second version reply", OnActivity, {Opcode(1)}, c_szPipeFaultActivityState},
         {"start before version", OnActivityRaw, {StartMessage(a, l)}, c_szPipeFaultActivityState},
         {"second start",
@@ -134,11 +126,8 @@ TEST_F(CoreProtocol, EveryClientFaultClosesOnlyThatPipe)
          c_szPipeFaultActivityState},
         {"activity message over 1200 bytes", OnActivity, {Opcode(3, 1500)}, nullptr},
         {"collector: 3 bytes", OnCollector, {Message(3)}, c_szPipeFaultCollectorSize},
-        {"register: 19 bytes", OnCollector, {Register(k, 19)}, c_szPipeFaultCollectorSize},
-        {"result part: 11 bytes", OnCollector, {Opcode(7, 11)}, c_szPipeFaultCollectorSize},
         {"result past message", OnCollector, {ResultPart(true, 10, 9)}, c_szPipeFaultCollectorSize},
         {"collector opcode 9", OnCollector, {Opcode(9)}, c_szPipeFaultCollectorOpcode},
-        {"collector opcode 2", OnCollector, {Opcode(2)}, c_szPipeFaultCollectorOpcode},
         {"second register", OnCollector, {Register(k), Register(k)}, c_szPipeFaultCollectorState},
         {"second collector version", OnCollector, {Opcode(1)}, c_szPipeFaultCollectorState},
         {"collector message over 1200 bytes", OnCollector, {Opcode(7, 1500)}, nullptr},

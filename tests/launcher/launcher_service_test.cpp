@@ -2,13 +2,9 @@
 // facility, the policy file in the prefix, the Wi-Fi and chamber stand-ins, the installed test
 // application against a loopback relay, and the coordinator's stop.
 #include "tests/launcher/launchertestsupport.h"
-#include "platform/endpointdirectory/endpointdirectory.h"
-#include "platform/securityruntime/securityruntime.h"
-#include "platform/wifi/wifiuser.h"
-#include "service/udptestpolicy.h"
 #include "tests/common/coordinator.h"
+#include "service/udptestlaunch.h"
 #include "tests/common/policyserver.h"
-#include "tests/common/udpsupport.h"
 
 #include <algorithm>
 #include <functional>
@@ -60,19 +56,6 @@ protected:
         ASSERT_TRUE(m_trace.WaitForLine(c_szHandlerToggled, cToggled + 1));
     }
 
-    // An open policy for a loopback relay on usPort that echoes cPackets, the service started
-    // and the backlight changed: returns once the test application was launched.
-    void LaunchAgainstRelay(USHORT usPort, unsigned cPackets)
-    {
-        WritePolicyFile(
-            {{"RelayPort", std::to_string(usPort)}, {"NumPackets", std::to_string(cPackets)}});
-        m_pRelay.reset(new CRelayProcess(usPort, L"-packets " + std::to_wstring(cPackets)));
-        ASSERT_TRUE(m_pRelay->Listening());
-        StartService();
-        ToggleBacklight({0, 0, 0, 0});
-        ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
-    }
-
     // The relay's report once the application sent all it was to send.
     static std::string Echoed(unsigned cPackets)
     {
@@ -90,95 +73,84 @@ protected:
 };
 } // namespace
 
-TEST_F(LauncherServiceTest, BacklightChangeRunsTestAgainstRelay)
+// A backlight change runs the test against the policy's relay and remembers the start in the
+// saved policy; an expired policy is first fetched from the web service, with the device
+// certificate, and the answer is what the gates judge (what the refresh saves is
+// UdpTestRefresh's). While the test application runs, changes are ignored and a stop waits for
+// it to end by itself; so too after the policy could not be saved, since the process is
+// tracked anyway.
+TEST_F(LauncherServiceTest, BacklightChangeRunsTestThatHoldsTheStop)
 {
-    DWORD cLaunches = ChamberLaunchCount();
-    ULONGLONG ullBefore = UdpConfigNow();
-    LaunchAgainstRelay(47301, 20);
-    EXPECT_EQ(cLaunches + 1, ChamberLaunchCount());
-    const std::string strArguments = "-localIP 127.0.0.1 -count 20 127.0.0.1 47301";
-    EXPECT_EQ(CommandLine(strArguments), ChamberLastCommandLine());
-    EXPECT_TRUE(m_trace.Contains("2008|" + Narrow(CommandLine(strArguments))));
-    EXPECT_TRUE(m_trace.Contains(c_szLoadingConfig));
-
-    EXPECT_EQ(Echoed(20), m_pRelay->WaitForReport());
-    ASSERT_TRUE(WaitUntil([] { return !ResultFiles().empty(); }));
-    std::string strResult = ReadFileText(ResultFiles()[0]);
-    EXPECT_NE(std::string::npos, strResult.find("\"Received\":20")) << strResult;
-
-    // The start is remembered in the saved policy, with the rest of it unchanged.
-    std::string strSaved = ReadFileText(c_wszUdpConfigFile);
-    size_t ichLastTest = strSaved.find("\"LastTest\":");
-    ASSERT_NE(std::string::npos, ichLastTest) << strSaved;
-    EXPECT_LE(ullBefore, std::stoull(strSaved.substr(ichLastTest + 11)));
-    EXPECT_NE(std::string::npos, strSaved.find("\"RelayPort\":47301,")) << strSaved;
-
-    StopService();
-    EXPECT_TRUE(m_trace.Contains(c_szFinishedDestruction));
-}
-
-// A value of 1 does nothing beyond the two trace lines; any other value, and data too short to
-// hold a value, runs the checks (here the policy's "Not enabled"). After the stop the launcher
-// no longer hears the backlight.
-TEST_F(LauncherServiceTest, BacklightValuesAndShortData)
-{
-    WritePolicyFile({{"Enabled", "false"}});
-    StartService();
-    const struct
-    {
-        std::vector<BYTE> vbData;
-        bool fChecks;
-    } rgCases[] = {
-        {{1, 0, 0, 0}, false}, {{0, 0, 0, 0}, true},
-        {{2, 0, 0, 0}, true},  {{1, 0, 0, 0, 7, 7}, false}, // only the first value counts
-        {{1, 0}, true},        {{}, true},
-    };
-    size_t cChecks = 0;
-    for (const auto &c : rgCases)
-    {
-        ToggleBacklight(c.vbData);
-        if (c.fChecks)
-        {
-            cChecks++;
-            ASSERT_TRUE(m_trace.WaitForLine(c_szNotAsked, cChecks)) << c.vbData.size();
-        }
-    }
-    StopService(); // drains the launcher's queue: nothing more is on its way
-    EXPECT_EQ(cChecks, m_trace.CountLines(c_szNotAsked));
-    EXPECT_EQ(cChecks, m_trace.CountLines("2001|Not enabled|0"));
-    EXPECT_EQ(1u, m_trace.CountLines(c_szLoadingConfig)); // the file is read once
-    EXPECT_EQ(1u, m_trace.CountLines(c_szFinishedDestruction));
-
-    size_t cCallbacks = m_trace.CountLines(c_szCallbackToggled);
-    Publish(c_ullBacklightStateName, 0);
-    Sleep(200);
-    EXPECT_EQ(cCallbacks, m_trace.CountLines(c_szCallbackToggled));
-}
-
-// While the test application runs, changes are ignored and a stop waits for it to end by
-// itself; so too after the policy could not be saved, since the process is tracked anyway.
-TEST_F(LauncherServiceTest, RunningTestIgnoresChangesAndHoldsTheStop)
-{
+    const USHORT usServerPort = 47330;
     const struct
     {
         const char *szName;
+        bool fRefresh;
         bool fSaveFails;
         USHORT usPort;
-    } rgCases[] = {{"saved", false, 47303}, {"save failed", true, 47304}};
+    } rgCases[] = {{"expired and refreshed", true, false, 47303},
+                   {"save failed", false, true, 47304}};
     for (const auto &c : rgCases)
     {
         SCOPED_TRACE(c.szName);
         PreparePrefix();
         m_trace.Clear();
+        const std::string strPort = std::to_string(c.usPort);
+        CTestPolicyServer server;
+        if (c.fRefresh)
+        {
+            WritePolicyFile({{"Enabled", "false"},
+                             {"RelayPort", "47399"},
+                             {"Expiration", std::to_string(UdpConfigNow() - 10000000)}});
+            PolicyServerOptions options;
+            options.usPort = usServerPort;
+            options.fUseBody = true;
+            options.strBody =
+                "{\"Enabled\":\"true\",\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":" + strPort +
+                ",\"NumPackets\":250,\"MaxTestDay\":24,\"Policy\":\"BattAC\","
+                "\"DurationValid\":\"P1D\"}";
+            ASSERT_TRUE(server.Start(options));
+            HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
+                          L"https://localhost:" + std::to_wstring(usServerPort) + L"/");
+            Publish(c_ullPowerSourceStateName, 1); // the answer allows battery power
+        }
+        else
+        {
+            WritePolicyFile({{"RelayPort", strPort}, {"NumPackets", "250"}});
+        }
         if (c.fSaveFails)
         {
             // A folder where the new policy would be written makes every save fail.
             ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr));
         }
+        m_pRelay.reset(new CRelayProcess(c.usPort, L"-packets 250")); // five seconds of sending
+        ASSERT_TRUE(m_pRelay->Listening());
         DWORD cLaunches = ChamberLaunchCount();
-        LaunchAgainstRelay(c.usPort, 250); // five seconds of sending
+        ULONGLONG ullBefore = UdpConfigNow();
+        StartService();
+        ToggleBacklight({0, 0, 0, 0});
+        ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
+        EXPECT_EQ(c.fRefresh ? 1u : 0u, m_trace.CountLines("2005")) << "refreshed";
+        EXPECT_FALSE(m_trace.Contains(c_szConfigExpired)) << "refreshed once, at the first load";
+        const std::string strArguments = "-localIP 127.0.0.1 -count 250 127.0.0.1 " + strPort;
+        EXPECT_EQ(CommandLine(strArguments), ChamberLastCommandLine());
+        EXPECT_TRUE(m_trace.Contains("2008|" + Narrow(CommandLine(strArguments))));
+        // Started in the test application's own chamber.
+        std::wstring wstrSid, wstrInstance;
+        DWORD dwType = 0;
+        ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberSid", &dwType, &wstrSid));
+        ASSERT_TRUE(
+            HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberInstance", &dwType, &wstrInstance));
+        EXPECT_EQ(0u, wstrSid.rfind(L"S-1-15-2-", 0));
+        EXPECT_STREQ(c_wszUdpTestChamberInstance, wstrInstance.c_str());
         EXPECT_EQ(c.fSaveFails, m_trace.Contains("2001|CreateFile (write)|80070005"))
             << "the failed save is traced";
+        // The start is remembered in the saved policy, with the rest of it unchanged.
+        std::string strSaved = ReadFileText(c_wszUdpConfigFile);
+        size_t ichLastTest = strSaved.find("\"LastTest\":");
+        ASSERT_NE(std::string::npos, ichLastTest) << strSaved;
+        EXPECT_EQ(!c.fSaveFails, ullBefore <= std::stoull(strSaved.substr(ichLastTest + 11)));
+        EXPECT_NE(std::string::npos, strSaved.find("\"RelayPort\":" + strPort)) << strSaved;
         ASSERT_TRUE(ResultFiles().empty()) << "the test ended before the next change";
         ToggleBacklight({0, 0, 0, 0});
         ToggleBacklight({2, 0, 0, 0});
@@ -194,67 +166,17 @@ TEST_F(LauncherServiceTest, RunningTestIgnoresChangesAndHoldsTheStop)
     }
 }
 
-// An expired policy is fetched from the web service, with the device certificate, before the
-// gates are judged; the answer's relay is the one tested and the saved file carries it.
-TEST_F(LauncherServiceTest, ExpiredPolicyIsRefreshedFromWebService)
-{
-    const USHORT usServerPort = 47330;
-    WritePolicyFile({{"Enabled", "false"},
-                     {"RelayPort", "47399"},
-                     {"Expiration", std::to_string(UdpConfigNow() - 10000000)}}); // a second ago
-    PolicyServerOptions options;
-    options.usPort = usServerPort;
-    options.fUseBody = true;
-    options.strBody = "{\"Enabled\":\"true\",\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":47331,"
-                      "\"NumPackets\":10,\"MaxTestDay\":24,\"Policy\":\"BattAC\","
-                      "\"DurationValid\":\"P1D\"}";
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(options));
-    HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                  L"https://localhost:" + std::to_wstring(usServerPort) + L"/");
-    Publish(c_ullPowerSourceStateName, 1); // the answer allows battery power
-    CRelayProcess relay(47331, L"-packets 10");
-    ASSERT_TRUE(relay.Listening());
-    StartService();
-
-    ULONGLONG ullBefore = UdpConfigNow();
-    ToggleBacklight({0, 0, 0, 0});
-    ASSERT_TRUE(m_trace.WaitForLine(c_szLaunched));
-    ULONGLONG ullAfter = UdpConfigNow();
-    EXPECT_EQ(Echoed(10), relay.WaitForReport());
-    EXPECT_EQ(CommandLine("-localIP 127.0.0.1 -count 10 127.0.0.1 47331"),
-              ChamberLastCommandLine());
-    std::vector<std::string> rgRequests = server.Requests();
-    ASSERT_EQ(1u, rgRequests.size());
-    EXPECT_NE(std::string::npos, rgRequests[0].find("/v1/api/config/udpecho")) << rgRequests[0];
-    EXPECT_EQ(1u, m_trace.CountLines("2005")) << "refreshed";
-    EXPECT_FALSE(m_trace.Contains(c_szConfigExpired)) << "refreshed once, at the first load";
-
-    // The saved policy holds the answer with its absolute expiration, a day after the fetch.
-    std::string strSaved = ReadFileText(c_wszUdpConfigFile);
-    EXPECT_EQ(0u, strSaved.find("{\"Enabled\":true,\"RelayFQDN\":\"127.0.0.1\",\"RelayPort\":47331,"
-                                "\"Expiration\":"))
-        << strSaved;
-    unsigned long long ullExpiration =
-        std::stoull(strSaved.substr(strSaved.find("\"Expiration\":") + 13));
-    EXPECT_LE(ullBefore + c_ullDay, ullExpiration);
-    EXPECT_GE(ullAfter + c_ullDay, ullExpiration);
-    EXPECT_NE(std::string::npos, strSaved.find(",\"Policy\":\"BattAC\"}")) << strSaved;
-}
-
-// Every gate that refuses, and every launch step that fails, traces why and starts nothing.
+// Every gate that refuses, and a launch step that fails, traces why and starts nothing. How
+// each gate judges its values (the relay's name, the spacing of tests, the Wi-Fi stand-in's
+// failures, the launch's other failures) is the UDP suites' to check; here one row per gate.
+// A backlight value of 1 does nothing beyond the two trace lines; any other value, and data
+// too short to hold a value, runs the checks, with the policy file read once. After the stop
+// the launcher no longer hears the backlight.
 TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
 {
     const std::string strOneHourAgo = std::to_string(UdpConfigNow() - c_ullDay / 24);
-    const std::string strLongRelay = "\"" + std::string(220, 'r') + "\"";
     auto power = [](std::vector<BYTE> vbData) {
         return [=] { Publish(c_ullPowerSourceStateName, vbData); };
-    };
-    auto wifiFails = [](const wchar_t *wszCall) {
-        return [=] { WiFiStandInSetFailure(wszCall, c_hrWiFiStandInFailure); };
-    };
-    auto chamberFails = [](const wchar_t *wszCall) {
-        return [=] { ChamberStandInSetFailure(wszCall, CHAMBER_STANDIN_FAILURE); };
     };
     const char szNotEnabled[] = "2001|Not enabled|0";
     const char szNoRelay[] = "2001|No relay to test against|0";
@@ -267,14 +189,16 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         PolicyMembers policy;                // replaces members of the open policy
         std::function<void()> pfnPrefix;     // changes the open prefix
         std::vector<std::string> rgExpected; // the failure lines, in this order
+        std::vector<std::vector<BYTE>> rgToggles = {{0, 0, 0, 0}}; // the backlight's values
     } rgCases[] = {
-        {"disabled", {{"Enabled", "false"}}, nullptr, {szNotEnabled}},
-        {"enabled as text", {{"Enabled", "\"yes\""}}, nullptr, {szNotEnabled}},
+        {"disabled, backlight values",
+         {{"Enabled", "false"}},
+         nullptr,
+         {szNotEnabled, szNotEnabled, szNotEnabled, szNotEnabled},
+         {{1, 0, 0, 0}, {0, 0, 0, 0}, {2, 0, 0, 0}, {1, 0, 0, 0, 7, 7}, {1, 0}, {}}},
         // The reader gives a saved empty name back as null.
         {"empty relay", {{"RelayFQDN", "\"\""}}, nullptr, {szNoRelay}},
-        {"relay null", {{"RelayFQDN", "\"null\""}}, nullptr, {szNoRelay}},
         {"relay port 0", {{"RelayPort", "0"}}, nullptr, {szNoRelay}},
-        {"relay port not a number", {{"RelayPort", "\"x47310\""}}, nullptr, {szNoRelay}},
         {"on battery", {}, power({1, 0, 0, 0}), {szNotOnAc}},
         {"power state too short", {}, power({0, 0}), {szNotOnAc}},
         {"battery allowed, no Wi-Fi",
@@ -284,44 +208,16 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
              WiFiStandInSetDisconnected();
          },
          {szNoWiFi}},
-        {"Wi-Fi disconnected", {}, [] { WiFiStandInSetDisconnected(); }, {szNoWiFi}},
-        {"Wi-Fi handle fails",
-         {},
-         wifiFails(L"OpenHandle"),
-         {"2001|WiFiUserHandle::OpenHandle|80070015", szNoWiFi}},
-        {"Wi-Fi state fails",
-         {},
-         wifiFails(L"QueryConnectionState"),
-         {"2001|QueryConnectionState|80070015", szNoWiFi}},
-        {"Wi-Fi adapter fails",
-         {},
-         wifiFails(L"QueryAdapterInfo"),
-         {"2001|QueryAdapterInfo|80070015", szNoWiFi}},
         {"tested an hour ago", {{"LastTest", strOneHourAgo}}, nullptr, {szNotTime}},
-        {"no tests a day", {{"LastTest", "1"}, {"MaxTestDay", "0"}}, nullptr, {szNotTime}},
-        {"negative tests a day", {{"LastTest", "1"}, {"MaxTestDay", "-2"}}, nullptr, {szNotTime}},
-        {"tests a day not a number",
-         {{"LastTest", "1"}, {"MaxTestDay", "\"often\""}},
-         nullptr,
-         {szNotTime}},
         // The record is reset before the file is read, and the refresh brings nothing.
         {"no policy file",
          {},
          [] { DeleteFileW(c_wszUdpConfigFile); },
          {"2001|CreateFile (read)|80070002", "2001|GetServiceEndpoint|80070002", szNotEnabled}},
-        {"no chamber",
-         {},
-         chamberFails(L"GetChamberSidFromId"),
-         {"2001|GetChamberSidFromId|80070005"}},
         {"chamber refuses the process",
          {},
-         chamberFails(L"CreateProcessInChamber"),
+         [] { ChamberStandInSetFailure(L"CreateProcessInChamber", CHAMBER_STANDIN_FAILURE); },
          {"2001|CreateProcessInChamber|80070005"}},
-        // The line would be cut, and a cut line tests against another relay or port.
-        {"command line too long",
-         {{"RelayFQDN", strLongRelay}},
-         nullptr,
-         {"2001|StringCchPrintf|8007007a"}},
     };
     for (const auto &c : rgCases)
     {
@@ -336,8 +232,13 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         m_trace.Clear();
         StartService();
 
-        ToggleBacklight({0, 0, 0, 0});
+        for (const std::vector<BYTE> &vbData : c.rgToggles)
+        {
+            ToggleBacklight(vbData);
+        }
         StopService(); // every handler has run when the launcher is destroyed
+        EXPECT_EQ(1u, m_trace.CountLines(c_szLoadingConfig));
+        EXPECT_EQ(1u, m_trace.CountLines(c_szFinishedDestruction));
         std::vector<std::string> rgLines = m_trace.Lines(), rgFailures;
         std::copy_if(
             rgLines.begin(), rgLines.end(), std::back_inserter(rgFailures),
@@ -346,4 +247,8 @@ TEST_F(LauncherServiceTest, RefusalsAreTracedAndStartNothing)
         EXPECT_FALSE(m_trace.Contains(c_szLaunched));
         EXPECT_EQ(cLaunches, ChamberLaunchCount());
     }
+    size_t cCallbacks = m_trace.CountLines(c_szCallbackToggled);
+    Publish(c_ullBacklightStateName, 0);
+    Sleep(200);
+    EXPECT_EQ(cCallbacks, m_trace.CountLines(c_szCallbackToggled));
 }

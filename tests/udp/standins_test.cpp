@@ -60,37 +60,32 @@ TEST_F(StandIns, TelvanectlRefusesBadWiFiCommands)
     }
 }
 
-TEST_F(StandIns, ChamberSidIsStablePerName)
+// A chamber's SID is stable per name, whatever its case; a process starts only in a chamber,
+// and either call fails when telvanectl says so.
+TEST_F(StandIns, ChamberSidsAndStarts)
 {
-    PSID pSid1 = nullptr;
-    PSID pSid2 = nullptr;
-    PSID pSid3 = nullptr;
-    ASSERT_EQ(S_OK, GetChamberSidFromId(L"ZoRiVirOruz", &pSid1));
-    ASSERT_EQ(S_OK, GetChamberSidFromId(L"zorivirORUZ", &pSid2));
-    ASSERT_EQ(S_OK, GetChamberSidFromId(L"OtherChamber", &pSid3));
-    EXPECT_TRUE(EqualSid(pSid1, pSid2));
-    EXPECT_FALSE(EqualSid(pSid1, pSid3));
-    EXPECT_EQ(8, *GetSidSubAuthorityCount(pSid1)); // 2 and seven from the name
-    LocalFree(pSid1);
-    LocalFree(pSid2);
-    LocalFree(pSid3);
-
+    PSID rgpSid[3] = {};
+    ASSERT_EQ(S_OK, GetChamberSidFromId(L"ZoRiVirOruz", &rgpSid[0]));
+    ASSERT_EQ(S_OK, GetChamberSidFromId(L"zorivirORUZ", &rgpSid[1]));
+    ASSERT_EQ(S_OK, GetChamberSidFromId(L"OtherChamber", &rgpSid[2]));
+    EXPECT_TRUE(EqualSid(rgpSid[0], rgpSid[1]));
+    EXPECT_FALSE(EqualSid(rgpSid[0], rgpSid[2]));
+    EXPECT_EQ(8, *GetSidSubAuthorityCount(rgpSid[0])); // 2 and seven from the name
     PSID pSid = reinterpret_cast<PSID>(1);
     EXPECT_EQ(E_INVALIDARG, GetChamberSidFromId(L"", &pSid));
     EXPECT_EQ(nullptr, pSid);
     EXPECT_EQ(E_INVALIDARG, GetChamberSidFromId(nullptr, &pSid));
-}
 
-TEST_F(StandIns, ChamberStartsOnlyInChambersAndFailsWhenTelvanectlSaysSo)
-{
     STARTUPINFOW si = {sizeof(si)};
     PROCESS_INFORMATION pi = {};
     wchar_t wszCommandLine[] = L"cmd.exe /c exit 0";
-    PSID pSid = nullptr;
     ASSERT_TRUE(ConvertStringSidToSidW(L"S-1-1-0", &pSid)); // Everyone is no chamber
     EXPECT_EQ(E_INVALIDARG, CreateProcessInChamber(pSid, L"{x}", nullptr, wszCommandLine, FALSE, 0,
                                                    nullptr, &si, &pi));
-    LocalFree(pSid);
+    for (PSID p : {pSid, rgpSid[0], rgpSid[1], rgpSid[2]})
+    {
+        LocalFree(p);
+    }
 
     ASSERT_EQ(0u, RunTelvanectl(L"platform chamber fail GetChamberSidFromId").dwExitCode);
     pSid = nullptr;

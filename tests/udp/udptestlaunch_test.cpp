@@ -1,5 +1,5 @@
-// The Wi-Fi gate against the Wi-Fi stand-in, and the launch of the installed test
-// application through the chamber stand-in against the loopback relay.
+// The Wi-Fi gate against the Wi-Fi stand-in, and the launch's failures before the test
+// application starts (the started launch is LauncherServiceTest's, through the service).
 #include "platform/securityruntime/securityruntime.h"
 #include "platform/wifi/wifiuser.h"
 #include "service/udptestlaunch.h"
@@ -28,7 +28,6 @@ protected:
     {
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, WIFI_STANDIN_KEY);
         RegDeleteKeyW(HKEY_LOCAL_MACHINE, CHAMBER_STANDIN_KEY);
-        RemoveDirectoryW(c_wszUdpConfigTempFile);
         DeleteFileW(c_wszUdpConfigFile);
     }
 
@@ -42,14 +41,6 @@ protected:
         config.numPackets = 10;
         config.delay = 1;
         return config;
-    }
-
-    // Waits (bounded) for a started test and closes its handle.
-    static void WaitAndClose(HANDLE hProcess)
-    {
-        ASSERT_NE(INVALID_HANDLE_VALUE, hProcess);
-        EXPECT_EQ(WAIT_OBJECT_0, WaitForSingleObject(hProcess, 90000));
-        CloseHandle(hProcess);
     }
 };
 } // namespace
@@ -98,42 +89,6 @@ TEST_F(UdpTestLaunch, WiFiGate)
     EXPECT_EQ(nullptr, pHandle);
 }
 
-TEST_F(UdpTestLaunch, StartsTheTestInItsChamberAndSaves)
-{
-    CRelayProcess relay(47215);
-    ASSERT_TRUE(relay.Listening());
-    UdpTestConfig config = RelayConfig(47215);
-    CTraceSession session;
-    uint64_t ullBefore = UdpConfigNow();
-    HANDLE hProcess = INVALID_HANDLE_VALUE;
-    EXPECT_EQ(S_OK, LaunchUdpTest(&config, &hProcess));
-    uint64_t ullAfter = UdpConfigNow();
-    DWORD dwProcessId = GetProcessId(hProcess);
-    WaitAndClose(hProcess);
-
-    const std::string strCommandLine = "C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
-                                       "127.0.0.1 -delay 1 -count 10 127.0.0.1 47215";
-    EXPECT_EQ(std::vector<std::string>({"2008|" + strCommandLine, "2007"}), session.Lines());
-    // The chamber stand-in records what it started, and in which chamber.
-    std::wstring wstrSid, wstrInstance, wstrCommandLine;
-    DWORD dwType = 0, dwRecordedId = 0;
-    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberSid", &dwType, &wstrSid));
-    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastChamberInstance", &dwType, &wstrInstance));
-    ASSERT_TRUE(HklmReadRaw(CHAMBER_STANDIN_KEY, L"LastCommandLine", &dwType, &wstrCommandLine));
-    ASSERT_TRUE(HklmReadDword(CHAMBER_STANDIN_KEY, L"LastProcessId", &dwRecordedId));
-    EXPECT_EQ(0u, wstrSid.rfind(L"S-1-15-2-", 0));
-    EXPECT_STREQ(c_wszUdpTestChamberInstance, wstrInstance.c_str());
-    EXPECT_EQ(strCommandLine, Narrow(wstrCommandLine.c_str()));
-    EXPECT_EQ(dwProcessId, dwRecordedId);
-    EXPECT_LE(ullBefore, config.lastTest);
-    EXPECT_GE(ullAfter, config.lastTest);
-    EXPECT_NE(
-        std::string::npos,
-        ReadFileText(c_wszUdpConfigFile).find("\"LastTest\":" + std::to_string(config.lastTest)));
-    EXPECT_EQ("received 10 echoed 10 end idle\n", relay.WaitForReport());
-    EXPECT_EQ(1u, ResultFiles().size());
-}
-
 TEST_F(UdpTestLaunch, FailuresBeforeTheStartStartNothing)
 {
     const std::string strLine = "2008|C:\\programs\\zoriviroruz\\ZoRiVirOruz.exe -localIP "
@@ -174,16 +129,4 @@ TEST_F(UdpTestLaunch, FailuresBeforeTheStartStartNothing)
         EXPECT_EQ(c.szFailure, rgLines[1]);
     }
     EXPECT_EQ(INVALID_FILE_ATTRIBUTES, GetFileAttributesW(c_wszUdpConfigFile));
-}
-
-TEST_F(UdpTestLaunch, StartedTestIsHandedOutWhenTheSaveFails)
-{
-    ASSERT_TRUE(CreateDirectoryW(c_wszUdpConfigTempFile, nullptr)); // the save cannot write
-    UdpTestConfig config = RelayConfig(47217);
-    config.numPackets = 1;
-    HANDLE hProcess = INVALID_HANDLE_VALUE;
-    HRESULT hr = LaunchUdpTest(&config, &hProcess);
-    EXPECT_TRUE(FAILED(hr));
-    EXPECT_NE(0u, config.lastTest);
-    WaitAndClose(hProcess); // tracked, so no second test could run beside it
 }

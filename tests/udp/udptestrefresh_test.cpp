@@ -79,54 +79,50 @@ protected:
         HklmDeleteValue(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole);
     }
 };
-
-void RefreshAgainst(const RefreshCase &c, USHORT usPort)
-{
-    PolicyServerOptions options;
-    options.usPort = usPort;
-    options.iStatus = c.iStatus;
-    options.strBody = c.szBody;
-    options.fUseBody = true;
-    options.cChunks = c.cChunks;
-    CTestPolicyServer server;
-    ASSERT_TRUE(server.Start(options));
-    HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
-                  L"https://localhost:" + std::to_wstring(usPort) + L"/");
-
-    CTraceSession session;
-    UdpTestConfig config;
-    ResetUdpConfig(&config);
-    uint64_t ullBefore = UdpConfigNow();
-    RefreshUdpConfig(&config);
-    uint64_t ullAfter = UdpConfigNow();
-
-    uint64_t ullLifetime = c.ullLifetime != 0 ? c.ullLifetime : c_ullUdpConfigRetryTicks;
-    EXPECT_LE(ullBefore + ullLifetime, config.expiration);
-    EXPECT_GE(ullAfter + ullLifetime, config.expiration);
-    uint64_t ullSavedExpiration = 0;
-    EXPECT_EQ(c.szSaved, WithoutExpiration(ReadFileText(c_wszUdpConfigFile), &ullSavedExpiration));
-    EXPECT_EQ(config.expiration, ullSavedExpiration);
-
-    std::vector<std::string> rgExpected = {"2005"};
-    rgExpected.insert(rgExpected.end(), c.rgstrFailures.begin(), c.rgstrFailures.end());
-    rgExpected.push_back("2007");
-    EXPECT_EQ(rgExpected, session.Lines());
-
-    // The service saw one GET of the policy path.
-    std::vector<std::string> rgRequests = server.Requests();
-    ASSERT_EQ(1u, rgRequests.size());
-    EXPECT_NE(std::string::npos, rgRequests[0].find("/v1/api/config/udpecho")) << rgRequests[0];
-}
 } // namespace
 
+// The service sees one GET of the policy path, on a port of each case's own (a later request
+// may reuse an earlier connection).
 TEST_F(UdpTestRefresh, AppliesAndSavesTheAnswer)
 {
-    // A port each: a later request may reuse an earlier connection.
     USHORT usPort = 47220;
     for (const RefreshCase &c : c_rgRefreshCases)
     {
         SCOPED_TRACE(c.szName);
-        RefreshAgainst(c, usPort++);
         DeleteFileW(c_wszUdpConfigFile);
+        PolicyServerOptions options;
+        options.usPort = usPort++;
+        options.iStatus = c.iStatus;
+        options.strBody = c.szBody;
+        options.fUseBody = true;
+        options.cChunks = c.cChunks;
+        CTestPolicyServer server;
+        ASSERT_TRUE(server.Start(options));
+        HklmSetString(ENDPOINT_DIRECTORY_KEY, c_wszUdpConfigRole,
+                      L"https://localhost:" + std::to_wstring(options.usPort) + L"/");
+
+        CTraceSession session;
+        UdpTestConfig config;
+        ResetUdpConfig(&config);
+        uint64_t ullBefore = UdpConfigNow();
+        RefreshUdpConfig(&config);
+        uint64_t ullAfter = UdpConfigNow();
+
+        uint64_t ullLifetime = c.ullLifetime != 0 ? c.ullLifetime : c_ullUdpConfigRetryTicks;
+        EXPECT_LE(ullBefore + ullLifetime, config.expiration);
+        EXPECT_GE(ullAfter + ullLifetime, config.expiration);
+        uint64_t ullSavedExpiration = 0;
+        EXPECT_EQ(c.szSaved,
+                  WithoutExpiration(ReadFileText(c_wszUdpConfigFile), &ullSavedExpiration));
+        EXPECT_EQ(config.expiration, ullSavedExpiration);
+
+        std::vector<std::string> rgExpected = {"2005"};
+        rgExpected.insert(rgExpected.end(), c.rgstrFailures.begin(), c.rgstrFailures.end());
+        rgExpected.push_back("2007");
+        EXPECT_EQ(rgExpected, session.Lines());
+
+        std::vector<std::string> rgRequests = server.Requests();
+        ASSERT_EQ(1u, rgRequests.size());
+        EXPECT_NE(std::string::npos, rgRequests[0].find("/v1/api/config/udpecho")) << rgRequests[0];
     }
 }
