@@ -285,6 +285,9 @@ TEST_F(ServiceShell, StopUnderHostGoesThroughTheStopCallback)
     service.m_hStartDone = startDone.Get();
     ASSERT_EQ(0u, RunAsHosted(service, globals));
     EXPECT_STREQ(L"TestGroup", CTestService::Group());
+    // A host that keeps the DLL loaded pushes again at every start: the service is listed.
+    CService::HostPushServiceGlobals(&service, L"TestGroup", &globals);
+    EXPECT_EQ(0u, failures.Count());
 
     CService::ServiceControlHandler(SERVICE_CONTROL_STOP, 0, nullptr, &service);
     ASSERT_EQ(WAIT_OBJECT_0, WaitForSingleObject(stopEntered.Get(), c_dwWaitMs));
